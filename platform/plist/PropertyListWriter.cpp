@@ -1,0 +1,136 @@
+#include <fmt/format.h>
+#include <nettle/base64.h>
+
+#include <cmath>
+#include <iterator>
+
+#include "platform/plist/PropertyList.h"
+#include "platform/value/DateText.h"
+#include "platform/value/Utf8.h"
+
+namespace platform {
+namespace {
+
+class PropertyListWriter {
+ public:
+  std::optional<std::string> write(const Value& value, Error* error) {
+    out_ = "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<plist version=\"1.0\">\n";
+    bool written = writeValue(value, 0);
+    out_ += "</plist>\n";
+    if (written && out_.size() > kPropertyListMaxBytes) written = refuse("a document of this length");
+    if (written) return std::move(out_);
+    setError(error, {kPropertyListErrorDomain, kPropertyListErrorWrite,
+                     fmt::format("{} cannot be written as a property list", refused_)});
+    return std::nullopt;
+  }
+
+ private:
+  bool writeValue(const Value& value, std::size_t depth) {
+    if (depth >= kPropertyListMaxDepth) return refuse("a value nested this deep");
+    switch (value.kind()) {
+      case Kind::Nothing:
+        return refuse("the nothing value");
+      case Kind::Boolean:
+        return line(depth, value.exactBoolean() ? "<true/>" : "<false/>");
+      case Kind::Signed:
+        return line(depth, fmt::format("<integer>{}</integer>", value.exactSigned()));
+      case Kind::Unsigned:
+        return line(depth, fmt::format("<integer>{}</integer>", value.exactUnsigned()));
+      case Kind::Real:
+        if (!std::isfinite(value.realValue())) return refuse("a real that is not finite");
+        return line(depth, fmt::format("<real>{}</real>", value.realValue()));
+      case Kind::Date: {
+        const std::optional<std::string> text = dateText(value.date());
+        return text ? line(depth, fmt::format("<date>{}</date>", *text)) : refuse("a date beyond the year 9999");
+      }
+      case Kind::String:
+        return writeText(value.string(), "string", depth);
+      case Kind::Data:
+        return writeData(value.bytes(), depth);
+      case Kind::Uuid:
+        return refuse("a UUID");
+      case Kind::Message:
+        return refuse("a message");
+      case Kind::Descriptor:
+        return refuse("a descriptor");
+      case Kind::Array:
+        return writeArray(value, depth);
+      case Kind::Dictionary:
+        return writeDictionary(value, depth);
+    }
+    return false;
+  }
+
+  bool writeArray(const Value& value, std::size_t depth) {
+    if (value.size() == 0) return line(depth, "<array/>");
+    line(depth, "<array>");
+    for (const Value& item : value.items()) {
+      if (!writeValue(item, depth + 1)) return false;
+    }
+    return line(depth, "</array>");
+  }
+
+  bool writeDictionary(const Value& value, std::size_t depth) {
+    if (value.size() == 0) return line(depth, "<dict/>");
+    line(depth, "<dict>");
+    for (const Value::Entry& entry : value.entries()) {
+      if (!writeText(entry.key, "key", depth + 1) || !writeValue(entry.value, depth + 1)) return false;
+    }
+    return line(depth, "</dict>");
+  }
+
+  bool writeText(std::string_view text, std::string_view element, std::size_t depth) {
+    if (!isXmlText(text)) return refuse("a string with characters that XML lacks");
+    out_.append(depth, '\t');
+    fmt::format_to(std::back_inserter(out_), "<{}>", element);
+    for (const char c : text) {
+      switch (c) {
+        case '&':
+          out_ += "&amp;";
+          break;
+        case '<':
+          out_ += "&lt;";
+          break;
+        case '>':
+          out_ += "&gt;";
+          break;
+        case '\r':
+          out_ += "&#13;";
+          break;  // as it stands a reader would make a line feed of it
+        default:
+          out_ += c;
+      }
+    }
+    fmt::format_to(std::back_inserter(out_), "</{}>\n", element);
+    return true;
+  }
+
+  bool writeData(const Bytes& bytes, std::size_t depth) {
+    std::string text(BASE64_ENCODE_RAW_LENGTH(bytes.size()), '\0');
+    base64_encode_raw(text.data(), bytes.size(), bytes.data());
+    return line(depth, fmt::format("<data>{}</data>", text));
+  }
+
+  bool line(std::size_t depth, std::string_view text) {
+    out_.append(depth, '\t');
+    out_ += text;
+    out_ += '\n';
+    return true;
+  }
+
+  bool refuse(const char* what) {
+    refused_ = what;
+    return false;
+  }
+
+  std::string out_;
+  const char* refused_ = "";
+};
+
+}  // namespace
+
+std::optional<std::string> serializeXml(const Value& value, Error* error) {
+  return PropertyListWriter().write(value, error);
+}
+
+}  // namespace platform
