@@ -1,0 +1,16 @@
+// How registry records read in log lines. Free functions without state, for any thread.
+#pragma once
+
+#include <string>
+
+#include "platform/registry/Records.h"
+
+namespace extora {
+
+/// The records one after the other in parentheses.
+std::string describeRecords(const platform::PlugInRecords& records);
+
+/// "bundle identifier, plug-in identifier(version) UUID path", without the comma; "(null)" for what a record lacks.
+std::string describeInstallation(const platform::ARExtoraProxy& record);
+
+}  // namespace extora

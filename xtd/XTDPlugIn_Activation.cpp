@@ -1,0 +1,99 @@
+#include <cstdlib>
+#include <iterator>
+
+#include "Extora/XTBundle.h"
+#include "Extora/XTLog.h"
+#include "platform/jobs/JobManager.h"
+#include "xtd/XTDIpcClient.h"
+#include "xtd/XTDPlugIn.h"
+#include "xtd/XTDServer.h"
+
+namespace extora {
+
+namespace {
+
+constexpr const char* kKeyboardService = "com.orvane.keyboard-service";
+constexpr const char* kNetguardFilterData = "com.orvane.netguard.filter-data";
+constexpr const char* kKeyboardNetworkConsent = "com.orvane.consent.keyboard-network";
+constexpr const char* kDefaultProfile = "plugin";
+
+// The profiles that follow from the extension point of the plug-in dictionary alone.
+struct ProfileRow {
+  std::string_view extensionPoint;
+  const char* profile;
+};
+constexpr ProfileRow kProfiles[] = {
+    {"com.orvane.glance.extension.preview", "glanced"},
+    {"com.orvane.glance.preview", "glance-preview"},
+    {"com.orvane.glance.preview.highmemory", "glance-preview"},
+    {"com.orvane.glance.thumbnail", "glance-thumbnail"},
+    {"com.orvane.glance.thumbnail.highmemory", "glance-thumbnail"},
+    {"com.orvane.app.non-ui-extension", "sketchpad-devtools"},
+    {"com.orvane.app.non-ui-extension.multiple-instances", "sketchpad-devtools"},
+    {"com.orvane.callscreen.message-filter", "message-filter"},
+    {"com.orvane.callscreen.classification-ui", "classification-ui"},
+};
+
+}  // namespace
+
+const char* XTDPlugIn::sandboxProfile() const {
+  const std::string declared = pluginKey(XTSDKInfoKey).string();
+  if (declared == kKeyboardService) {
+    const Value openAccess = attribute("RequestsOpenAccess");
+    const bool granted = openAccess == Value(true) && allowedConsentServices().count(kKeyboardNetworkConsent) != 0;
+    return granted ? kDefaultProfile : "keyboard";
+  }
+  if (declared == kNetguardFilterData) return "network-filter";
+  const std::string& registered = plugInDictionary()[XTSDKInfoKey].string();
+  for (const ProfileRow& row : kProfiles) {
+    if (row.extensionPoint == registered) return row.profile;
+  }
+  return kDefaultProfile;
+}
+
+std::optional<Error> XTDPlugIn::enableForClient(XTDIpcClient& client, const Value& environment) const {
+  Dictionary variables(environment);
+  const std::string versionText = version().value_or("");
+  if (const auto container = dataContainerURL()) {
+    variables.set("HOME", container->path());
+    variables.set("HBFIXED_USER_HOME", container->path());
+    variables.set("TMPDIR", container->appending("tmp").path());
+  } else {
+    XTLogOps().debug("no data container for plug-in {}({}) {} at {}", identifier(), versionText, uuid(), path());
+  }
+  const char* profile = sandboxProfile();
+  if (const char* sdk = std::getenv("XTTEST_SDK")) variables.set("XTTEST_SDK", sdk);
+
+  Dictionary service;
+  if (const Value raw = infoKey("IPCService"); raw.isDictionary()) {
+    XTLogAr().debug("raw IPCService={}", raw);
+    service = Dictionary(raw);
+  } else {
+    XTLogOps().info("no IPCService for plug-in; database returned {}", raw);
+  }
+  for (const auto& entry : service["EnvironmentVariables"].entries()) variables.set(entry.key, entry.value);
+  service.set("EnvironmentVariables", variables);
+  service.set("_SandboxProfile", profile);
+  service.set("_OmitSandboxParameters", true);
+  XTLogOps().info("assigning plug-in {}({}) {} to {} sandbox", identifier(), versionText, uuid(), profile);
+  const Value overlay = Dictionary{{"IPCService", service}, {"HBBundlePackageType", "IPC!"}};
+  XTLogOps().def("allowing host {} {} to use plug-in {}({}) uuid={} at {}", client.pid(), client.path(), identifier(),
+                 versionText, uuid(), path());
+
+  const auto bundle = XTBundle::initWithURL(url());
+  const auto executable = bundle->executablePath();
+  if (!executable) {
+    XTLogOps().error("failed to obtain execPath for plug-in {}({}) bundle={}", *this, uuid(), *bundle);
+    return makeErrorWithFormat(XTErrorRequest, "cannot obtain executable path for plug-in {}({})", identifier(),
+                               uuid());
+  }
+  XTLogOps().debug("activation overlay={}", overlay);
+  const int result =
+      client.server()->platformServices()->jobs->jobAddExternalService(client.peer(), *executable, overlay);
+  if (result == 0) return std::nullopt;
+  XTLogOps().error("jobmgr error {} trying to allow {} {} to use plug-in {}({}) uuid={} at {}", result, client.pid(),
+                   client.path(), identifier(), versionText, uuid(), path());
+  return makeErrorWithFormat(XTErrorRequest, "unable to enable plug-in {}({})", identifier(), uuid());
+}
+
+}  // namespace extora
