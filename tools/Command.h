@@ -1,0 +1,33 @@
+// Command: one subcommand of a tool: its options, its help and its work.
+//
+// Made before the command line is read and used once, on the main thread.
+#pragma once
+
+#include <CLI/CLI.hpp>
+
+#include <string>
+
+#include "tools/DaemonSession.h"
+#include "tools/ExitStatus.h"
+
+namespace tools {
+
+class Command {
+ public:
+  Command() = default;
+  virtual ~Command() = default;
+  Command(const Command&) = delete;
+  Command& operator=(const Command&) = delete;
+
+  /// Adds its subcommand to `app`, whose parsing then fills this object, and answers it; `app` owns it.
+  virtual CLI::App* addTo(CLI::App& app) = 0;
+
+  /// Does the work after a successful parse. What belongs on standard output is appended to `out`; complaints have been
+  /// written to standard error already.
+  [[nodiscard]] virtual ExitStatus run(DaemonSession& daemon, std::string& out) = 0;
+};
+
+/// Writes "xtctl: text" as one line to standard error, with control characters escaped.
+void complain(const std::string& text);
+
+}  // namespace tools
