@@ -1,0 +1,111 @@
+// How long does a host wait for the daemon's answer? A real xtd in private directories with 10, 100 and 1000 plug-ins,
+// asked over its socket by the client library; beside each figure the floor for frames of the same size, measured in
+// the same run, so that the figure that counts is the ratio.
+#include <fmt/format.h>
+#include <stdlib.h>
+
+#include <algorithm>
+#include <chrono>
+#include <cstdio>
+#include <cstdlib>
+#include <functional>
+#include <vector>
+
+#include "Extora/XTDaemonClient.h"
+#include "bench/RawEcho.h"
+#include "platform/ipc/IpcCodec.h"
+#include "platform/ipc/IpcFrame.h"
+#include "platform/log/Log.h"
+#include "tests/support/Daemon.h"
+#include "tests/support/SampleBundles.h"
+
+namespace {
+
+using extora::XTDaemonClient;
+using platform::Dictionary;
+using platform::Value;
+using Clock = std::chrono::steady_clock;
+
+struct Sample {
+  double median;  // microseconds
+  double p99;
+};
+
+// Runs `work` until 2000 times or a second have passed, after a tenth of that to warm up.
+Sample measure(const std::function<void()>& work) {
+  constexpr int kTimes = 2000;
+  std::vector<double> times;
+  const auto start = Clock::now();
+  for (int i = -kTimes / 10; i < kTimes && Clock::now() - start < std::chrono::seconds(1); ++i) {
+    const auto before = Clock::now();
+    work();
+    const std::chrono::duration<double, std::micro> time = Clock::now() - before;
+    if (i >= 0 || Clock::now() - start > std::chrono::milliseconds(100)) times.push_back(time.count());
+  }
+  std::sort(times.begin(), times.end());
+  return {times[times.size() / 2], times[times.size() * 99 / 100]};
+}
+
+// One request through the client library, synchronously; its reply body.
+Value ask(XTDaemonClient& client, const Dictionary& request) {
+  Value body;
+  client.sendSynchronously(true, request, [&](const platform::IpcReplyObject& reply) {
+    if (const auto error = XTDaemonClient::errorInReply(reply)) {
+      fmt::print(stderr, "bench_daemon: {}\n", error->localizedDescription());
+      std::exit(1);
+    }
+    body = reply.body;
+  });
+  return body;
+}
+
+std::size_t frameSize(const Value& body) {
+  platform::Bytes bytes;
+  platform::encodeValue(body, bytes);
+  return bytes.size() + platform::IpcFrameHeader::kSize;
+}
+
+void row(const std::string& what, std::size_t installed, XTDaemonClient& client, const Dictionary& request) {
+  const std::size_t requestSize = frameSize(request);
+  const std::size_t replySize = frameSize(ask(client, request));
+  const Sample daemon = measure([&] { (void)ask(client, request); });
+  bench::RawEcho echo(requestSize, replySize);
+  const Sample raw = measure([&] { echo.roundTrip(); });
+  fmt::print("{:<26}{:>10}{:>14}{:>12.1f}{:>12.1f}{:>12.1f}{:>12.1f}{:>8.1f}\n", what, installed, replySize,
+             daemon.median, daemon.p99, raw.median, raw.p99, daemon.median / raw.median);
+  std::fflush(stdout);
+}
+
+void measureWith(std::size_t plugIns) {
+  tests::Daemon daemon;
+  daemon.setEnvironment("EXTORA_LOG", "default");
+  for (const auto& application : tests::sampleApplications(plugIns / 10, 10)) {
+    tests::writeBundle(daemon.applications(), application);
+  }
+  daemon.start();
+  ::setenv("EXTORA_RUNTIME_DIR", daemon.runtime().c_str(), 1);
+  const auto client = XTDaemonClient::initWithServiceName(std::nullopt);
+
+  Dictionary match = client->request("match");
+  const Value forms = client->convertFromIPC(ask(*client, match)["matches"]);
+  if (forms.size() != plugIns) {
+    fmt::print(stderr, "bench_daemon: {} plug-ins are offered, not {}\n", forms.size(), plugIns);
+    std::exit(1);
+  }
+  Dictionary find = client->request("find");
+  find.set("uuids", *platform::Uuid::parse(forms.at(0)["uuid"].string()));
+  row("find", plugIns, *client, find);
+  row("match, all", plugIns, *client, match);
+  match.set("rules", Dictionary{{"HXExtensionIdentifier", forms.at(0)["identifier"]}});
+  row("match, one of them", plugIns, *client, match);
+}
+
+}  // namespace
+
+int main() {
+  platform::Log::configure("fault");  // the client's own lines would be part of what is measured
+  fmt::print("{:<26}{:>10}{:>14}{:>12}{:>12}{:>12}{:>12}{:>8}\n", "request", "plug-ins", "reply bytes", "median us",
+             "p99 us", "raw median", "raw p99", "ratio");
+  for (const std::size_t plugIns : {10, 100, 1000}) measureWith(plugIns);
+  return 0;
+}

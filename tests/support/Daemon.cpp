@@ -1,0 +1,164 @@
+#include "tests/support/Daemon.h"
+
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <signal.h>
+#include <stdlib.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <cstring>
+#include <fstream>
+#include <iostream>
+
+#include "platform/ipc/IpcCodec.h"
+
+namespace tests {
+namespace {
+
+sockaddr_un addressOf(const std::filesystem::path& path) {
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  std::strncpy(address.sun_path, path.c_str(), sizeof address.sun_path - 1);
+  return address;
+}
+
+const sockaddr* generic(const sockaddr_un& address) {
+  return reinterpret_cast<const sockaddr*>(&address);
+}
+
+}  // namespace
+
+Client::Client(const std::string& runtime, const std::string& service)
+    : connection_(platform::ipcConnectService(runtime, service, queue_)) {
+  connection_->setEventHandler([](const platform::IpcEvent&) {});
+  connection_->resume();
+}
+
+Client::~Client() {
+  connection_->cancel();
+}
+
+Value Client::send(const Dictionary& request) {
+  const auto reply = connection_->sendWithReplySync(request);
+  EXPECT_FALSE(reply.error) << reply.describe();
+  return reply.body;
+}
+
+Value Client::request(std::string_view type, Dictionary entries) {
+  entries.set("request", type);
+  if (!entries.contains("version")) entries.set("version", std::uint64_t{3});
+  return send(entries);
+}
+
+Array Client::match(const Dictionary& rules, std::uint64_t flags) {
+  const Value reply = request("match", {{"rules", rules}, {"flags", flags}});
+  EXPECT_TRUE(reply["error"].isNothing()) << reply.describe();
+  return Array(platform::fromWireMessage(reply["matches"]));
+}
+
+Daemon::Daemon() {
+  std::string pattern = (std::filesystem::temp_directory_path() / "extora.XXXXXX").string();
+  if (::mkdtemp(pattern.data()) == nullptr) std::abort();
+  root_ = std::filesystem::canonical(pattern);
+  for (const auto& place : {config() / "preferences", applications(), systemApplications(), systemPlugIns(),
+                            extensionPoints(), root_ / "profiles"}) {
+    std::filesystem::create_directories(place);
+  }
+  environment_ = {{"EXTORA_RUNTIME_DIR", runtime()},
+                  {"EXTORA_STATE_DIR", state()},
+                  {"EXTORA_CONFIG_DIR", config()},
+                  {"EXTORA_APPLICATIONS", applications()},
+                  {"EXTORA_SYSTEM_APPLICATIONS", systemApplications()},
+                  {"EXTORA_SYSTEM_PLUGINS", systemPlugIns()},
+                  {"EXTORA_EXTENSION_POINTS", extensionPoints()},
+                  {"EXTORA_GLOBAL_ANNOTATIONS", root_ / "Extora-Annotations"},
+                  {"EXTORA_PROFILES", root_ / "profiles"},
+                  {"EXTORA_PLUGIN_USER", std::to_string(::getuid())},
+                  {"EXTORA_MULTI_USER", "0"},
+                  {"EXTORA_LOG", "debug"},
+                  {"EXTORA_INTERNAL_DIAGNOSTICS", "0"},
+                  {"EXTORA_TERMINATION_GRACE_MS", "5000"},
+                  {"LANG", "C.UTF-8"}};
+}
+
+Daemon::~Daemon() {
+  if (process_) stop();
+  if (::testing::Test::HasFailure()) std::cerr << "--- log of the daemon\n" << log() << "---\n";
+  std::error_code ignored;
+  std::filesystem::remove_all(root_, ignored);
+}
+
+std::filesystem::path Daemon::socket(const std::string& service) const {
+  return runtime() / "services" / service;
+}
+
+void Daemon::start(const std::vector<std::string>& arguments) {
+  const auto notifyPath = root_ / "ready";
+  std::filesystem::remove(notifyPath);
+  const auto address = addressOf(notifyPath);
+  const platform::UniqueFd ready(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+  ASSERT_EQ(::bind(ready.get(), generic(address), sizeof address), 0) << std::strerror(errno);
+  auto environment = environment_;
+  environment["NOTIFY_SOCKET"] = notifyPath;
+  std::vector<std::string> all{XTD_BINARY};
+  all.insert(all.end(), arguments.begin(), arguments.end());
+  process_ = std::make_unique<RunningProgram>(all, environment, STDERR_FILENO);
+  pollfd events[] = {{ready.get(), POLLIN, 0}, {process_->pidfd(), POLLIN, 0}};
+  ASSERT_GT(::poll(events, 2, kDeadlineMs), 0) << "the daemon does not get ready";
+  ASSERT_NE(events[0].revents, 0) << "the daemon ended with status " << process_->wait();
+}
+
+int Daemon::run(const std::vector<std::string>& arguments) {
+  std::vector<std::string> all{XTD_BINARY};
+  all.insert(all.end(), arguments.begin(), arguments.end());
+  process_ = std::make_unique<RunningProgram>(all, environment_, STDERR_FILENO);
+  return process_->wait();
+}
+
+int Daemon::stop() {
+  process_->signal(SIGTERM);
+  return process_->wait();
+}
+
+bool Daemon::waitForLog(std::string_view text, std::size_t count) {
+  return process_->waitForOutput(text, count);
+}
+
+std::size_t Daemon::countInLog(std::string_view text) const {
+  return countOf(log(), text);
+}
+
+platform::UniqueFd Daemon::connectRaw() const {
+  platform::UniqueFd fd(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  const auto address = addressOf(socket());
+  EXPECT_EQ(::connect(fd.get(), generic(address), sizeof address), 0) << std::strerror(errno);
+  const timeval limit{kDeadline.count(), 0};
+  ::setsockopt(fd.get(), SOL_SOCKET, SO_RCVTIMEO, &limit, sizeof limit);
+  return fd;
+}
+
+std::string Daemon::hostProgram() {
+  return TEST_HOST_BINARY;
+}
+
+std::string Daemon::askAsHost(const std::filesystem::path& executable, std::uint64_t flags,
+                              const std::string& identifier) const {
+  std::vector<std::string> arguments{executable, runtime(), kService, std::to_string(flags)};
+  if (!identifier.empty()) arguments.push_back(identifier);
+  RunningProgram host(arguments, {}, STDOUT_FILENO);
+  host.wait();
+  return host.output();
+}
+
+std::uint64_t Daemon::notificationCount(const std::string& name) const {
+  std::ifstream file(runtime() / "notify" / name, std::ios::binary);
+  unsigned char bytes[8] = {};
+  EXPECT_TRUE(file.read(reinterpret_cast<char*>(bytes), sizeof bytes)) << "no notification " << name;
+  std::uint64_t count = 0;
+  for (int i = 7; i >= 0; --i) count = count << 8 | bytes[i];
+  return count;
+}
+
+}  // namespace tests

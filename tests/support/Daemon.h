@@ -1,0 +1,100 @@
+// Daemon: a real xtd, the shipped binary, in private directories under one temporary folder.
+//
+// A test lays out what it needs (bundles, preferences), starts the daemon, talks to it, stops it. Nothing sleeps: every
+// wait has a condition and a deadline, and the daemon's log is printed when a test has failed. For one thread.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <filesystem>
+#include <map>
+#include <memory>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/files/UniqueFd.h"
+#include "platform/ipc/IpcConnection.h"
+#include "platform/queue/SerialQueue.h"
+#include "platform/value/Value.h"
+#include "tests/support/RunningProgram.h"
+
+namespace tests {
+
+using platform::Array;
+using platform::Dictionary;
+using platform::Value;
+
+/// One connection to the daemon.
+class Client {
+ public:
+  Client(const std::string& runtime, const std::string& service);
+  ~Client();
+  /// Sends `request` and waits for its reply dictionary; fails the test when the connection broke instead.
+  Value send(const Dictionary& request);
+  /// As send, of a request of `type` and version 3 with further entries.
+  Value request(std::string_view type, Dictionary entries = {});
+  /// The forms of a "match"; fails the test when the daemon refused it.
+  Array match(const Dictionary& rules, std::uint64_t flags = 0);
+  platform::IpcConnection& connection() { return *connection_; }
+  platform::SerialQueue& queue() { return queue_; }
+
+ private:
+  platform::SerialQueue queue_{"test client"};
+  std::shared_ptr<platform::IpcConnection> connection_;
+};
+
+class Daemon {
+ public:
+  static constexpr const char* kService = "com.orvane.extora.xtd";
+
+  /// Makes the folders; starts nothing.
+  Daemon();
+  /// Stops the daemon, prints its log when the test has failed, and removes the folder.
+  ~Daemon();
+
+  // Places, all below root().
+  const std::filesystem::path& root() const { return root_; }
+  std::filesystem::path runtime() const { return root_ / "run"; }
+  std::filesystem::path state() const { return root_ / "state"; }
+  std::filesystem::path config() const { return root_ / "config"; }
+  std::filesystem::path applications() const { return root_ / "Applications"; }
+  std::filesystem::path systemApplications() const { return root_ / "System" / "Applications"; }
+  std::filesystem::path systemPlugIns() const { return root_ / "System" / "PlugIns"; }
+  std::filesystem::path extensionPoints() const { return root_ / "System" / "ExtensionPoints"; }
+  std::filesystem::path socket(const std::string& service = kService) const;
+
+  /// Sets a variable of the daemons to be started.
+  void setEnvironment(const std::string& name, const std::string& value) { environment_[name] = value; }
+  const std::map<std::string, std::string>& environment() const { return environment_; }
+
+  /// Starts the daemon and waits until it says that it is ready.
+  void start(const std::vector<std::string>& arguments = {});
+  /// Starts a daemon that is not expected to serve, and answers its exit status; output() has what it said.
+  int run(const std::vector<std::string>& arguments);
+  /// Ends it with SIGTERM; its exit status.
+  int stop();
+  RunningProgram& process() { return *process_; }
+
+  std::string log() const { return process_ ? process_->output() : std::string(); }
+  [[nodiscard]] bool waitForLog(std::string_view text, std::size_t count = 1);
+  std::size_t countInLog(std::string_view text) const;
+
+  Client connect(const std::string& service = kService) const { return {runtime().string(), service}; }
+  /// A raw connected socket, for bytes that no client would send.
+  platform::UniqueFd connectRaw() const;
+  /// The program of the tests' host (tests/system/TestHost.cpp), to be put into a bundle or beside entitlements.
+  static std::string hostProgram();
+  /// Lets a copy of that host ask this daemon with "match"; what it printed.
+  std::string askAsHost(const std::filesystem::path& executable, std::uint64_t flags = 0,
+                        const std::string& identifier = "") const;
+  /// How often the system-wide notification has been posted.
+  std::uint64_t notificationCount(const std::string& name) const;
+
+ private:
+  std::filesystem::path root_;
+  std::map<std::string, std::string> environment_;
+  std::unique_ptr<RunningProgram> process_;
+};
+
+}  // namespace tests

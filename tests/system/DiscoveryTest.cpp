@@ -1,0 +1,175 @@
+// Discovery end to end: which of the installed plug-ins a host is offered, and in which form.
+#include <gtest/gtest.h>
+
+#include <algorithm>
+
+#include "Extora/XTProtocol.h"
+#include "Extora/XTVocabulary.h"
+#include "tests/support/Daemon.h"
+#include "tests/support/SampleBundles.h"
+
+namespace extora {
+namespace {
+
+using platform::Array;
+using platform::Dictionary;
+using platform::Value;
+using tests::sampleApplication;
+using tests::SampleBundle;
+using tests::samplePlugIn;
+
+using Texts = std::vector<std::string>;
+
+SampleBundle versioned(const std::string& identifier, const std::string& version) {
+  return samplePlugIn(identifier, {{XTVersionAttribute, version}});
+}
+
+class DiscoveryTest : public ::testing::Test {
+ protected:
+  /// Writes an application of these plug-ins into a folder of the daemon that is to be started.
+  std::string write(const std::filesystem::path& folder, const std::string& name, std::vector<SampleBundle> plugIns) {
+    return tests::writeBundle(folder, sampleApplication("com.example." + name, std::move(plugIns)));
+  }
+  /// As write, with the tests' host as the application's program; the host's path.
+  std::string writeHost(const std::string& name, std::vector<SampleBundle> plugIns) {
+    auto application = sampleApplication("com.example." + name, std::move(plugIns));
+    application.info.set("HBBundleExecutable", "host");
+    application.program = tests::Daemon::hostProgram();
+    return tests::writeBundle(daemon_.applications(), application) + "/host";
+  }
+  /// "identifier version" of what this process is offered, sorted.
+  Texts match(std::uint64_t flags = 0, const Dictionary& rules = {}) {
+    auto client = daemon_.connect();
+    Texts texts;
+    for (const Value& form : client.match(rules, flags)) {
+      texts.push_back(form["identifier"].string() + " " + form["version"].string());
+    }
+    std::sort(texts.begin(), texts.end());
+    return texts;
+  }
+  void setExclusions(const Value& exclusions) {
+    tests::writePropertyList(daemon_.config() / "preferences" / "com.orvane.extora.userprefs.plist",
+                             Dictionary{{XTExclusionsPreferenceKey, exclusions}});
+  }
+
+  tests::Daemon daemon_;
+};
+
+TEST_F(DiscoveryTest, AFormTellsAllAboutAPlugIn) {
+  auto filter = versioned("com.example.filter", "2.5");
+  filter.entitlements = Dictionary{{"com.example.right", true}};
+  filter.info.set("HBBundleDisplayName", "Mail Filter");
+  const auto application = write(daemon_.applications(), "mail", {filter});
+  daemon_.start();
+  const auto forms = daemon_.connect().match({});
+  ASSERT_EQ(forms.size(), 1U);
+  const Value& form = forms[0];
+  EXPECT_EQ(form["path"].string(), application + "/PlugIns/filter.appex");
+  EXPECT_EQ(form["containingPath"].string(), application);
+  EXPECT_EQ(form["version"].string(), "2.5");
+  EXPECT_EQ(form["localizedDisplayName"].string(), "Mail Filter");
+  EXPECT_TRUE(form["systemResident"] == Value(false));
+  EXPECT_TRUE(form["annotations"] == Value(Dictionary()));
+  EXPECT_TRUE(form["entitlements"] == filter.entitlements);
+  EXPECT_EQ(form["bundleInfo"]["HBBundleIdentifier"].string(), "com.example.filter");
+  EXPECT_TRUE(platform::Uuid::parse(form["uuid"].string()));
+  EXPECT_GT(form["lastmodified"].exactSigned(), 1'600'000'000);
+}
+
+TEST_F(DiscoveryTest, TheNewestVersionIsOfferedUnlessMoreAreAskedFor) {
+  write(daemon_.applications(), "a", {versioned("com.example.x", "1.9")});
+  write(daemon_.applications(), "b", {versioned("com.example.x", "1.10")});
+  write(daemon_.applications(), "c", {versioned("com.example.x", "1.010"), versioned("com.example.y", "1")});
+  daemon_.start();
+  const auto versions = [&](std::uint64_t flags) {
+    return match(flags, {{XTIdentifierAttribute, "com.example.x"}}).size();
+  };
+  EXPECT_EQ(match().size(), 2U);
+  EXPECT_TRUE(match()[0] == "com.example.x 1.10" || match()[0] == "com.example.x 1.010") << match()[0];
+  EXPECT_EQ(versions(0), 1U);
+  EXPECT_EQ(versions(XTDiscoverDuplicates), 1U);
+  EXPECT_EQ(versions(XTDiscoverAllVersions), 2U);
+  EXPECT_EQ(versions(XTDiscoverAllVersions | XTDiscoverDuplicates), 3U);
+}
+
+TEST_F(DiscoveryTest, TheSystemsOwnPlugInWinsAgainstAnEqualOne) {
+  write(daemon_.applications(), "a", {versioned("com.example.x", "1"), versioned("com.example.y", "2")});
+  write(daemon_.systemApplications(), "b", {versioned("com.example.x", "1"), versioned("com.example.y", "1")});
+  daemon_.start();
+  EXPECT_EQ(match(), Texts({"com.example.x 1", "com.example.y 2"}));
+  EXPECT_EQ(match(XTDiscoverSystemOnly), Texts({"com.example.x 1", "com.example.y 1"}));
+  for (const Value& form : daemon_.connect().match({{XTIdentifierAttribute, "com.example.x"}})) {
+    EXPECT_TRUE(form["systemResident"] == Value(true)) << form.describe();
+  }
+}
+
+TEST_F(DiscoveryTest, OverriderAndOverriddenNameEachOther) {
+  auto p = samplePlugIn("com.example.p");
+  p.entitlements = Dictionary{{XTOverrideEntitlement, "com.example.q"}};
+  write(daemon_.applications(), "a", {p, samplePlugIn("com.example.q"), samplePlugIn("com.example.r")});
+  daemon_.start();
+  std::map<std::string, Value> forms;
+  for (const Value& form : daemon_.connect().match({})) forms[form["identifier"].string()] = form;
+  ASSERT_EQ(forms.size(), 3U);
+  EXPECT_EQ(forms["com.example.q"]["overrider"].string(), forms["com.example.p"]["uuid"].string());
+  EXPECT_EQ(forms["com.example.p"]["overriding"].string(), "com.example.q");
+  for (const char* key : {"overrider", "overriding"}) EXPECT_TRUE(forms["com.example.r"][key].isNothing());
+  EXPECT_EQ(daemon_.countInLog("INFO ops: plug-in " + forms["com.example.p"]["uuid"].string() + " overrides " +
+                               forms["com.example.q"]["uuid"].string() + "\n"),
+            1U);
+}
+
+TEST_F(DiscoveryTest, AHostInAnApplicationIsOfferedItsOwnPlugIns) {
+  auto dedicated = samplePlugIn("com.example.dedicated");
+  tests::setPlugInKey(dedicated, "Dedicated", true);
+  const auto host = writeHost("host", {dedicated, versioned("com.example.x", "1")});
+  write(daemon_.applications(), "other", {versioned("com.example.x", "2")});
+  write(daemon_.systemApplications(), "system", {versioned("com.example.x", "1")});
+  daemon_.start();
+  const std::string own = std::filesystem::path(host).parent_path() / "PlugIns";
+  EXPECT_EQ(daemon_.askAsHost(host),
+            "com.example.dedicated 1.0 " + own + "/dedicated.appex\ncom.example.x 1 " + own + "/x.appex\n");
+  EXPECT_EQ(daemon_.countInLog(" in favor of bundle-relative '" + own + "/x.appex'\n"), 2U);
+  EXPECT_EQ(match(), Texts{"com.example.x 2"}) << "a host elsewhere";
+}
+
+TEST_F(DiscoveryTest, AManagerMayLookAtEverythingThatIsNotExcluded) {
+  auto dedicated = samplePlugIn("com.example.dedicated");
+  tests::setPlugInKey(dedicated, "Dedicated", true);
+  auto secret = samplePlugIn("com.example.secret");
+  tests::setPlugInKey(secret, std::string(XTHostEntitlementInfoKey), "com.example.key");
+  write(daemon_.applications(), "a", {dedicated, secret, samplePlugIn("com.example.plain")});
+  setExclusions(Array{Dictionary{{XTIdentifierAttribute, "com.example.plain"}}, "no rules"});
+  const auto stranger = daemon_.root() / "bin" / "stranger";
+  const auto manager = daemon_.root() / "bin" / "manager";
+  for (const auto& host : {stranger, manager}) {
+    std::filesystem::create_directories(host.parent_path());
+    std::filesystem::copy_file(tests::Daemon::hostProgram(), host);
+  }
+  tests::writePropertyList(manager.string() + ".entitlements", Dictionary{{XTManagerEntitlement, true}});
+  daemon_.start();
+  EXPECT_EQ(daemon_.askAsHost(stranger, XTDiscoverAll), "error 11 unauthorized discovery flag (XTDiscoverAll)\n");
+  EXPECT_EQ(daemon_.askAsHost(manager), "");
+  const auto lines = daemon_.askAsHost(manager, XTDiscoverAll);
+  EXPECT_EQ(tests::countOf(lines, "\n"), 2U) << lines;
+  EXPECT_EQ(tests::countOf(lines, "com.example.dedicated 1.0 "), 1U);
+  EXPECT_EQ(tests::countOf(lines, "com.example.secret 1.0 "), 1U);
+
+  setExclusions("no list");
+  EXPECT_EQ(match(), Texts{"com.example.plain 1.0"}) << "exclusions are read afresh";
+}
+
+TEST_F(DiscoveryTest, FollowsInstallsAndUninstalls) {
+  daemon_.start();
+  EXPECT_EQ(match(), Texts());
+  const auto application =
+      tests::installBundle(daemon_.applications(), sampleApplication("com.example.a", {samplePlugIn("com.example.x")}));
+  ASSERT_TRUE(daemon_.waitForLog("DEFAULT ops: plug-in INSTALLED:com.example.x com.example.x(1) "));
+  EXPECT_EQ(match(), Texts{"com.example.x 1.0"});
+  tests::removeBundle(application);
+  ASSERT_TRUE(daemon_.waitForLog("DEFAULT ops: plug-in UNINSTALLED:com.example.x com.example.x(1) "));
+  EXPECT_EQ(match(), Texts());
+}
+
+}  // namespace
+}  // namespace extora

@@ -1,0 +1,244 @@
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <stdio.h>
+#include <unistd.h>
+
+#include <fstream>
+#include <thread>
+
+#include "platform/registry/BundleRegistry.h"
+#include "tests/support/RegistryFixture.h"
+
+namespace platform {
+namespace {
+
+namespace fs = std::filesystem;
+using tests::installBundle;
+using tests::removeBundle;
+using tests::sampleApplication;
+using tests::SampleBundle;
+using tests::samplePlugIn;
+using tests::writeBundle;
+
+class BundleRegistryWatchTest : public tests::RegistryFixture {
+ protected:
+  BundleRegistryWatchTest() { options_.watch = true; }
+  bool waitForNames(const Names& wanted) {
+    const bool found = waitFor([&] { return names() == wanted; });
+    if (!found) ADD_FAILURE() << testing::PrintToString(names()) << testing::PrintToString(log_.take());
+    return found;
+  }
+  std::size_t linesWith(const std::string& text) {
+    for (std::string& line : log_.take()) lines_.push_back(std::move(line));
+    return static_cast<std::size_t>(std::count_if(
+        lines_.begin(), lines_.end(), [&](const auto& line) { return line.find(text) != std::string::npos; }));
+  }
+  std::vector<std::string> lines_;
+};
+
+TEST_F(BundleRegistryWatchTest, FollowsInstallsRemovalsAndReplacements) {
+  start();
+  const SampleBundle mail = sampleApplication("mail", {samplePlugIn("filter"), samplePlugIn("other")});
+  const std::string path = installBundle(apps_, mail);
+  ASSERT_TRUE(waitForNames({"filter", "other"}));
+  const PlugInRecord old = named("filter");
+  const auto knowledge = registry_->registryKnowledgeUUID();
+  ASSERT_TRUE(waitFor([&] { return options_.notifications->counter(kRegistryChangeNotification) == 1U; }));
+  EXPECT_EQ(observer_->take(), Names{"+filter other"});
+
+  installBundle(apps_, mail);
+  ASSERT_TRUE(waitFor([&] {
+    const PlugInRecord now = named("filter");
+    return now != nullptr && now->plugInUUID != old->plugInUUID;
+  }));
+  EXPECT_EQ(registry_->registryPlugInByUUID(*old->plugInUUID), nullptr);
+  EXPECT_NE(registry_->registryKnowledgeUUID(), knowledge);
+  EXPECT_EQ(named("filter")->dataContainerURL, old->dataContainerURL);
+
+  removeBundle(path);
+  writeBundle(directory_.path("plugins"), samplePlugIn("lone"));
+  ASSERT_TRUE(waitForNames({"lone"}));
+  Names told = observer_->take();
+  // The replacement is two changes or one, but always uninstalls before it installs.
+  std::erase(told, "+lone");
+  EXPECT_EQ(told, (Names{"-filter other", "+filter other", "-filter other"}));
+}
+
+TEST_F(BundleRegistryWatchTest, AnExchangeInOneStepIsAReplacementAlsoWhenTheFilesAreTheSame) {
+  const SampleBundle mail = sampleApplication("mail", {samplePlugIn("filter")});
+  const std::string path = writeBundle(apps_, mail);
+  start();
+  const auto first = named("filter")->plugInUUID;
+  // The new bundle shares its files with the old one, so that no stamp tells them apart.
+  const std::string twin = directory_.path("mail.app");
+  fs::copy(path, twin, fs::copy_options::recursive | fs::copy_options::create_hard_links);
+  ASSERT_EQ(::renameat2(AT_FDCWD, twin.c_str(), AT_FDCWD, path.c_str(), RENAME_EXCHANGE), 0);
+  const auto isAnother = [&](const std::optional<Uuid>& than) {
+    const PlugInRecord now = named("filter");
+    return now != nullptr && now->plugInUUID != than;
+  };
+  ASSERT_TRUE(waitFor([&] { return isAnother(first); }));
+  EXPECT_EQ(observer_->take(), (Names{"-filter", "+filter"}));
+
+  // Away and back before anybody looks: a new registration all the same.
+  const auto second = named("filter")->plugInUUID;
+  fs::rename(path, path + ".away");
+  fs::rename(path + ".away", path);
+  ASSERT_TRUE(waitFor([&] { return isAnother(second); }));
+  EXPECT_EQ(observer_->take(), (Names{"-filter", "+filter"}));
+}
+
+TEST_F(BundleRegistryWatchTest, ABundleThatIsCopiedInPlaceIsCompleteInTheEnd) {
+  start();
+  SampleBundle filter = samplePlugIn("filter");
+  filter.entitlements = Dictionary{{"right", true}};
+  filter.tables["de/InfoPlist"] = {{"HBBundleName", "Deutsch"}};
+  locale_->lang = "de";
+  const std::string source = writeBundle(directory_.path(), sampleApplication("mail", {samplePlugIn("a"), filter}));
+  const std::string path = apps_ + "/mail.app";
+  // In steps, each of which is seen before the next.
+  fs::create_directory(path);
+  ASSERT_TRUE(waitFor([&] { return linesWith("left out " + path + ": no Info.plist") == 1; }));
+  fs::copy_file(source + "/Info.plist", path + "/Info.plist");
+  ASSERT_TRUE(waitFor([&] { return registry_->registryAppByBundleURL(Url::file(path)) != nullptr; }));
+  fs::create_directory(path + "/PlugIns");
+  fs::copy(source + "/PlugIns/a.appex", path + "/PlugIns/a.appex", fs::copy_options::recursive);
+  ASSERT_TRUE(waitFor([&] { return named("a") != nullptr; }));
+  fs::copy(source, path, fs::copy_options::recursive | fs::copy_options::skip_existing);
+  ASSERT_TRUE(waitForNames({"a", "filter"}));
+  ASSERT_TRUE(waitFor([&] { return named("filter")->entitlements == filter.entitlements; }));
+  locale_->changeTo("de");
+  ASSERT_TRUE(waitFor([&] { return named("filter")->localizedName == "Deutsch"; }));
+  EXPECT_EQ(linesWith("left out " + path + ": no Info.plist"), 1U);
+}
+
+TEST_F(BundleRegistryWatchTest, ABrokenBundleIsLookedAtAgainWhenItChanges) {
+  const std::string path =
+      writeBundle(apps_, sampleApplication("mail", {samplePlugIn("good"), samplePlugIn("filter")}));
+  const std::string info = path + "/PlugIns/filter.appex/Info.plist";
+  const Value content = samplePlugIn("filter").info;
+  std::ofstream(info) << "<plist>";
+  start();
+  EXPECT_EQ(names(), Names{"good"});
+  EXPECT_EQ(linesWith("left out " + path + "/PlugIns/filter.appex: Info.plist: "), 1U);
+  const auto good = named("good")->plugInUUID;
+  tests::writePropertyList(info, content);
+  ASSERT_TRUE(waitForNames({"filter", "good"}));
+  EXPECT_EQ(named("good")->plugInUUID, good);
+
+  fs::create_directory_symlink(path, apps_ + "/linked.app");
+  fs::create_directory_symlink(apps_, apps_ + "/mail.app/PlugIns/cycle");
+  ASSERT_TRUE(waitFor([&] { return linesWith("left out " + apps_ + "/linked.app: it is a link") == 1; }));
+  EXPECT_EQ(names(), (Names{"filter", "good"}));
+  EXPECT_EQ(observer_->take(), Names{"+filter"});
+}
+
+TEST_F(BundleRegistryWatchTest, ABurstIsFollowedWholeAlsoWhenEventsAreLost) {
+  start();
+  Names all;
+  for (int i = 100; i < 150; ++i) {
+    const std::string identifier = "plugin" + std::to_string(i);
+    installBundle(apps_, sampleApplication("app" + std::to_string(i), {samplePlugIn(identifier)}));
+    all.push_back(identifier);
+  }
+  ASSERT_TRUE(waitForNames(all));
+
+  // More events than the kernel keeps, while nobody reads them.
+  std::size_t limit = 0;
+  std::ifstream("/proc/sys/fs/inotify/max_queued_events") >> limit;
+  ASSERT_GT(limit, 0U);
+  const std::string one = apps_ + "/x";
+  const std::string other = apps_ + "/y";
+  fs::create_directory(one);
+  for (std::size_t i = 0; i < limit / 4 + 10; ++i) {
+    fs::rename(one, other);
+    fs::rename(other, one);
+  }
+  installBundle(apps_, sampleApplication("late", {samplePlugIn("late")}));
+  removeBundle(apps_ + "/app100.app");
+  all.erase(all.begin());
+  all.insert(all.begin(), "late");
+  ASSERT_TRUE(waitForNames(all));
+}
+
+TEST_F(BundleRegistryWatchTest, AFolderMayComeLaterBeMovedAwayOrBeMadeAnew) {
+  const std::string top = directory_.path("top");
+  const std::string folder = top + "/middle/apps";
+  options_.directories.applications = {folder};
+  start();
+  fs::create_directories(folder);
+  writeBundle(folder, sampleApplication("mail", {samplePlugIn("filter")}));
+  ASSERT_TRUE(waitForNames({"filter"}));
+  fs::rename(top, top + ".away");
+  ASSERT_TRUE(waitForNames({}));
+  fs::create_directories(folder);
+  installBundle(folder, sampleApplication("clock", {samplePlugIn("hands")}));
+  ASSERT_TRUE(waitForNames({"hands"}));
+  fs::rename(folder, folder + ".away");
+  fs::rename(top + ".away/middle/apps", folder);
+  ASSERT_TRUE(waitForNames({"filter"}));
+  fs::remove_all(folder);
+  ASSERT_TRUE(waitForNames({}));
+  fs::create_directory(folder);
+  installBundle(folder, sampleApplication("clock", {samplePlugIn("hands")}));
+  ASSERT_TRUE(waitForNames({"hands"}));
+}
+
+TEST_F(BundleRegistryWatchTest, WithoutEnoughWatchesTheFoldersArePolled) {
+  options_.mostWatches = 1;
+  start();
+  EXPECT_EQ(linesWith("there are not enough file watches"), 1U);
+  const std::string path = installBundle(apps_, sampleApplication("mail", {samplePlugIn("filter")}));
+  ASSERT_TRUE(waitForNames({"filter"}));
+  removeBundle(path);
+  ASSERT_TRUE(waitForNames({}));
+  EXPECT_EQ(linesWith("there are not enough file watches"), 1U) << "once";
+}
+
+TEST_F(BundleRegistryWatchTest, APlugInThatWasRegisteredByRequestIsFollowedToo) {
+  const std::string folder = directory_.path("vendor");
+  fs::create_directory(folder);
+  const std::string path =
+      writeBundle(folder, sampleApplication("mail", {samplePlugIn("filter"), samplePlugIn("not")}));
+  start();
+  ASSERT_EQ(registry_->registryRegisterPlugin(Url::file(path + "/PlugIns/filter.appex")), std::nullopt);
+  const auto first = named("filter")->plugInUUID;
+  fs::rename(path, path + ".away");
+  ASSERT_TRUE(waitForNames({}));
+  fs::rename(path + ".away", path);
+  ASSERT_TRUE(waitForNames({"filter"}));
+  EXPECT_NE(named("filter")->plugInUUID, first);
+  fs::remove_all(path + "/PlugIns/filter.appex");
+  ASSERT_TRUE(waitForNames({}));
+  EXPECT_EQ(observer_->take(), (Names{"+filter", "-filter", "+filter", "-filter"}));
+}
+
+TEST_F(BundleRegistryWatchTest, ReadersNeverWaitOrSeeHalfAChange) {
+  start();
+  std::atomic<bool> done = false;
+  std::atomic<bool> wrong = false;
+  std::thread reader([&] {
+    while (!done) {
+      const auto knowledge = registry_->registryKnowledgeUUID();
+      const SnapshotPtr now = registry_->snapshot();
+      for (const PlugInRecord& record : now->plugIns()) {
+        if (now->plugInByUUID(*record->plugInUUID) != record) wrong = true;
+        if (record->containingApplication->plugIns.size() != 2) wrong = true;
+      }
+      (void)registry_->registryPlugInsMatching(Dictionary{{"HXExtensionVersion", "1.0"}}, nullptr);
+      (void)knowledge;
+    }
+  });
+  const SampleBundle mail = sampleApplication("mail", {samplePlugIn("a"), samplePlugIn("b")});
+  for (int i = 0; i < 10; ++i) {
+    installBundle(apps_, mail);
+    locale_->changeTo(i % 2 == 0 ? "de" : "fr");
+    EXPECT_TRUE(waitForNames({"a", "b"}));
+  }
+  done = true;
+  reader.join();
+  EXPECT_FALSE(wrong);
+}
+
+}  // namespace
+}  // namespace platform

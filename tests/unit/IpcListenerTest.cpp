@@ -1,0 +1,281 @@
+#include "platform/ipc/IpcListener.h"
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/resource.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+
+#include "platform/ipc/IpcServiceAddress.h"
+#include "tests/support/ChildProcess.h"
+#include "tests/support/Eventually.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/PrintDescribed.h"
+
+namespace platform {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr const char* kService = "com.example.service";
+
+class IpcListenerTest : public testing::Test {
+ protected:
+  IpcListenerTest() {
+    std::string pattern = (fs::temp_directory_path() / "ipc-listener-XXXXXX").string();
+    runtime_ = ::mkdtemp(pattern.data());
+  }
+  ~IpcListenerTest() override {
+    if (listener_) listener_->cancel();
+    queue_.sync([] {});
+    fs::remove_all(runtime_);
+  }
+
+  // Serves; each connection echoes what it is asked.
+  bool serve() {
+    listener_ = ipcCreateListener(runtime_, kService, queue_, &error_);
+    if (!listener_) return false;
+    listener_->setEventHandler([this](const IpcEvent& event) {
+      EXPECT_TRUE(queue_.isCurrent());
+      if (const auto* connection = std::get_if<std::shared_ptr<IpcConnection>>(&event)) {
+        const std::weak_ptr<IpcConnection> weak = *connection;
+        (*connection)->setEventHandler([weak](const IpcEvent& inner) {
+          const auto* message = std::get_if<IpcMessage>(&inner);
+          if (message == nullptr) return;
+          IpcReply reply = ipcCreateReply(*message);
+          reply.body.set("echo", message->body);
+          if (const auto self = weak.lock()) self->send(reply);
+        });
+        accepted_.add(*connection);
+        (*connection)->resume();
+      } else {
+        errors_.add(std::get<IpcError>(event).text);
+      }
+    });
+    listener_->resume();
+    return true;
+  }
+  // What an own client gets back: "ok", or the error.
+  std::string ask(const std::string& runtime) {
+    const auto client = ipcConnectService(runtime, kService, queue_);
+    client->resume();
+    const Value body = Dictionary{{"request", "find"}};
+    const auto reply = client->sendWithReplySync(body);
+    return reply.body["echo"] == body ? "ok" : reply.describe();
+  }
+  // A raw client, for use in a child process too.
+  UniqueFd connectRaw() const {
+    const auto address = IpcServiceAddress::make(ipcServicesDirectory(runtime_), kService, nullptr);
+    UniqueFd socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    if (!address || ::connect(socket.get(), address->address(), address->size()) != 0) return {};
+    return socket;
+  }
+  fs::path socketPath() const { return fs::path(runtime_) / "services" / kService; }
+
+  std::string runtime_;
+  const SerialQueue queue_{"ipc"};
+  Error error_;
+  tests::Recorder<std::shared_ptr<IpcConnection>> accepted_;
+  tests::Recorder<std::string> errors_;
+  std::shared_ptr<IpcListener> listener_;
+};
+
+mode_t modeOf(const fs::path& path) {
+  struct stat status = {};
+  return ::stat(path.c_str(), &status) == 0 ? status.st_mode & 07777 : 0;
+}
+
+TEST_F(IpcListenerTest, ANameIsServedByOneAndFreeAgainAfterwards) {
+  const mode_t before = ::umask(077);
+  ASSERT_TRUE(serve()) << error_.describe();
+  ::umask(before);
+  EXPECT_EQ(modeOf(socketPath()), 0666U);
+  EXPECT_EQ(modeOf(socketPath().parent_path()), 0755U);
+  EXPECT_EQ(ask(runtime_), "ok");
+  EXPECT_EQ(accepted_.now().at(0)->peerPid(), ::getpid());
+
+  EXPECT_EQ(ipcCreateListener(runtime_, kService, queue_, &error_), nullptr);
+  EXPECT_NE(error_.describe().find("is already served"), std::string::npos) << error_.describe();
+  EXPECT_EQ(ask(runtime_), "ok");
+  EXPECT_NE(ipcCreateListener(runtime_, "com.example.other", queue_, &error_), nullptr);
+
+  listener_->cancel();
+  EXPECT_EQ(errors_.waitFor(1), std::vector<std::string>{"the listener was cancelled"});
+  EXPECT_FALSE(fs::exists(socketPath()));
+  EXPECT_EQ(ask(runtime_), "cannot connect to " + socketPath().string() + ": No such file or directory");
+  EXPECT_TRUE(serve()) << error_.describe();
+}
+
+TEST_F(IpcListenerTest, AStaleSocketIsReplacedAndNothingElseIs) {
+  fs::create_directories(socketPath().parent_path());
+  {
+    const UniqueFd stale(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    const auto address = IpcServiceAddress::make(ipcServicesDirectory(runtime_), kService, nullptr);
+    ASSERT_EQ(::bind(stale.get(), address->address(), address->size()), 0);
+  }
+  ASSERT_TRUE(serve()) << error_.describe();
+  EXPECT_EQ(ask(runtime_), "ok");
+  listener_->cancel();
+  std::ofstream(socketPath()) << "mine";
+  EXPECT_FALSE(serve());
+  EXPECT_NE(error_.describe().find("is no socket"), std::string::npos) << error_.describe();
+  EXPECT_TRUE(fs::is_regular_file(socketPath()));
+  // A socket that somebody has put in the place of the listener's is not the listener's to remove.
+  fs::remove(socketPath());
+  ASSERT_TRUE(serve()) << error_.describe();
+  fs::rename(socketPath(), socketPath().string() + ".moved");
+  std::ofstream(socketPath()) << "mine";
+  listener_->cancel();
+  EXPECT_TRUE(fs::exists(socketPath()));
+}
+
+TEST_F(IpcListenerTest, PathsTooLongForASocketAddressAndWrongNames) {
+  const std::string outer = runtime_;
+  runtime_ += "/" + std::string(120, 'd');
+  ASSERT_TRUE(serve()) << error_.describe();
+  EXPECT_EQ(ask(runtime_), "ok");
+  EXPECT_TRUE(fs::is_socket(socketPath()));
+  for (const char* name : {"", ".hidden", "a/b", "..", "-dash", "sp ace"}) {
+    EXPECT_EQ(ipcCreateListener(runtime_, name, queue_, &error_), nullptr) << name;
+  }
+  EXPECT_EQ(ipcCreateListener(runtime_, std::string(129, 'a'), queue_, &error_), nullptr);
+  EXPECT_NE(ask(outer).find("cannot connect to " + outer), std::string::npos);
+  listener_->cancel();
+  EXPECT_FALSE(fs::exists(socketPath()));
+  runtime_ = outer;
+}
+
+// Runs in the process that ActivationSocketsAreUsedAndStay has started.
+TEST_F(IpcListenerTest, DISABLED_ServeAnActivationSocket) {
+  ::setenv("LISTEN_PID", std::to_string(::getpid()).c_str(), 1);
+  runtime_ = std::getenv("TEST_RUNTIME");
+  ASSERT_TRUE(serve()) << error_.describe();
+  EXPECT_EQ(ask(runtime_), "ok");
+  EXPECT_EQ(accepted_.now().size(), 2U);  // with the one that came before
+  listener_->cancel();
+  EXPECT_TRUE(fs::is_socket(socketPath()));
+  runtime_ += "/none";  // the directory is the parent's to remove
+}
+
+TEST_F(IpcListenerTest, ActivationSocketsAreUsedAndStay) {
+  fs::create_directories(socketPath().parent_path());
+  const UniqueFd socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  const auto address = IpcServiceAddress::make(ipcServicesDirectory(runtime_), kService, nullptr);
+  ASSERT_EQ(::bind(socket.get(), address->address(), address->size()), 0);
+  ASSERT_EQ(::listen(socket.get(), 8), 0);
+  const UniqueFd early = connectRaw();
+  ASSERT_TRUE(early);
+  const pid_t child = ::fork();
+  if (child == 0) {
+    ::setenv("LISTEN_FDS", "2", 1);
+    ::setenv("LISTEN_FDNAMES", (std::string("com.example.else:") + kService).c_str(), 1);
+    ::setenv("TEST_RUNTIME", runtime_.c_str(), 1);
+    const int copy = ::fcntl(socket.get(), F_DUPFD, 10);
+    ::dup2(STDERR_FILENO, 3);
+    ::dup2(copy, 4);
+    ::execl("/proc/self/exe", "test", "--gtest_also_run_disabled_tests",
+            "--gtest_filter=IpcListenerTest.DISABLED_ServeAnActivationSocket", nullptr);
+    ::_exit(127);
+  }
+  int status = -1;
+  ::waitpid(child, &status, 0);
+  EXPECT_EQ(status, 0);
+}
+
+TEST_F(IpcListenerTest, WhenDescriptorsRunOutAcceptingWaitsAndGoesOn) {
+  tests::LogCapture log;
+  ASSERT_TRUE(serve()) << error_.describe();
+  const UniqueFd lowestFree(::open("/dev/null", O_RDONLY | O_CLOEXEC));
+  const UniqueFd client(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  struct rlimit before = {};
+  ::getrlimit(RLIMIT_NOFILE, &before);
+  const struct rlimit none = {static_cast<rlim_t>(client.get()) + 1, before.rlim_max};
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &none), 0);
+  const auto address = IpcServiceAddress::make(ipcServicesDirectory(runtime_), kService, nullptr);
+  EXPECT_EQ(::connect(client.get(), address->address(), address->size()), 0);
+  std::vector<std::string> lines;
+  EXPECT_TRUE(tests::eventually([&] {
+    for (auto& line : log.take()) lines.push_back(std::move(line));
+    return !lines.empty();
+  }));
+  ::setrlimit(RLIMIT_NOFILE, &before);
+  EXPECT_EQ(accepted_.waitFor(1).size(), 1U);
+  for (auto& line : log.take()) lines.push_back(std::move(line));
+  EXPECT_EQ(lines,
+            (std::vector<std::string>{"ERROR -: cannot accept connections to com.example.service for now: Too many "
+                                      "open files"}));
+}
+
+TEST_F(IpcListenerTest, ThePeerIsTheProcessThatConnectedAndNeverAnother) {
+  ASSERT_TRUE(serve()) << error_.describe();
+  const std::string self = fs::read_symlink("/proc/self/exe").string();
+  EXPECT_EQ(ask(runtime_), "ok");
+  const auto own = accepted_.waitFor(1).at(0)->peer();
+  EXPECT_EQ(own->executablePath(), self);
+  EXPECT_EQ(own->uid(), ::geteuid());
+  EXPECT_TRUE(own->isAlive());
+  EXPECT_TRUE(own->executableUnchanged());
+
+  // A client that runs another program afterwards, and then ends.
+  const auto connect = [this] { return ::dup2(connectRaw().get(), 100) == 100; };  // kept over exec
+  tests::ChildProcess child("/bin/cat", connect);
+  ASSERT_TRUE(child.running());
+  const auto changed = accepted_.waitFor(2).at(1)->peer();
+  EXPECT_EQ(changed->pid(), child.peer()->pid());
+  EXPECT_FALSE(changed->executableUnchanged() && changed->executablePath() == self);
+  EXPECT_TRUE(child.peer()->executableUnchanged());
+  child.end();
+  EXPECT_FALSE(changed->isAlive());
+  EXPECT_FALSE(child.peer()->executableUnchanged());
+
+  // A client that has ended before it is looked at is nobody.
+  listener_->cancel();
+  listener_ = ipcCreateListener(runtime_, kService, queue_, &error_);
+  ASSERT_TRUE(listener_) << error_.describe();
+  const pid_t gone = ::fork();
+  if (gone == 0) ::_exit(connectRaw() ? 0 : 1);
+  int status = -1;
+  ::waitpid(gone, &status, 0);
+  ASSERT_EQ(status, 0);
+  listener_->setEventHandler([this](const IpcEvent& event) {
+    if (const auto* connection = std::get_if<std::shared_ptr<IpcConnection>>(&event)) accepted_.add(*connection);
+  });
+  listener_->resume();
+  const auto nobody = accepted_.waitFor(3).at(2)->peer();
+  EXPECT_EQ(nobody->executablePath(), "");
+  EXPECT_FALSE(nobody->isAlive());
+  EXPECT_FALSE(nobody->executableUnchanged());
+}
+
+TEST_F(IpcListenerTest, AnExecutableThatWasDeletedOrReplacedIsNoLongerThePeers) {
+  const fs::path program = fs::path(runtime_) / "program";
+  fs::copy_file("/bin/cat", program);
+  tests::ChildProcess child(program);
+  ASSERT_TRUE(child.running());
+  const auto pidfd = [&] { return UniqueFd(static_cast<int>(::syscall(SYS_pidfd_open, child.peer()->pid(), 0))); };
+  EXPECT_EQ(child.peer()->executablePath(), program);
+  EXPECT_TRUE(child.peer()->executableUnchanged());
+  fs::copy_file("/bin/cat", runtime_ + "/other");
+  fs::rename(runtime_ + "/other", program);
+  EXPECT_FALSE(child.peer()->executableUnchanged());
+  EXPECT_EQ(PeerIdentity::ofPidfd(pidfd().get())->executablePath(), "");
+  // Unless it is really called so.
+  const fs::path odd = fs::path(runtime_) / "program (deleted)";
+  fs::copy_file("/bin/cat", odd);
+  const tests::ChildProcess other(odd);
+  ASSERT_TRUE(other.running());
+  EXPECT_EQ(other.peer()->executablePath(), odd);
+  EXPECT_EQ(PeerIdentity::ofSelf()->executablePath(), fs::read_symlink("/proc/self/exe"));
+}
+
+}  // namespace
+}  // namespace platform

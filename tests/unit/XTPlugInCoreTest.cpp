@@ -1,0 +1,251 @@
+#include "Extora/XTPlugInCore.h"
+
+#include <gtest/gtest.h>
+
+#include "Extora/XTDPlugInSignature.h"
+#include "platform/value/InternalInconsistency.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/PrintDescribed.h"
+
+namespace extora {
+namespace {
+
+using Lines = std::vector<std::string>;
+
+const Url kFilter = Url::file("/Applications/Mail.app/PlugIns/Filter.appex");
+const Url kPlain = Url::file("/System/PlugIns/Filter.plugin");
+
+Dictionary infoWith(Dictionary plugIn) {
+  return {{"HXExtension", std::move(plugIn)}, {"HBBundleDisplayName", "MailFilter"}};
+}
+
+std::shared_ptr<XTPlugInCore> record(const Value& info, const Url& url = kFilter) {
+  return XTPlugInCore::initWithName("com.example.filter", url, info, {}, std::nullopt);
+}
+
+TEST(XTPlugInCore, SetupFailuresAndTheirLines) {
+  tests::LogCapture log;
+  EXPECT_EQ(XTPlugInCore::initWithName("com.example.filter", std::nullopt, {}, {}, std::nullopt), nullptr);
+  EXPECT_EQ(log.take(), Lines{});
+
+  EXPECT_EQ(XTPlugInCore::initWithName(std::nullopt, kPlain, {}, {}, std::nullopt), nullptr);
+  EXPECT_EQ(log.take(), Lines{"ERROR ops: missing identifier in plug-in at /System/PlugIns/Filter.plugin"});
+
+  XTPlugInCore partly;
+  const Dictionary old = infoWith({{"Kept", true}});
+  ASSERT_TRUE(partly.setDictionaries(old));
+  EXPECT_FALSE(partly.setupWithName("com.example.filter", Url::file("/System/PlugIns/My Filter.plugin"),
+                                    Dictionary{{"HXExtension", Array{}}}, {}, std::nullopt));
+  EXPECT_EQ(log.take(), Lines{"DEFAULT ops: malformed plug-in dictionary in plug-in com.example.filter at "
+                              "file:///System/PlugIns/My%20Filter.plugin: {HXExtension: []}"});
+  EXPECT_EQ(partly.bundleInfoDictionary(), Value(Dictionary{{"HXExtension", Array{}}}));
+  EXPECT_TRUE(partly.pluginKey("Kept").booleanValue());
+  EXPECT_FALSE(partly.setDictionaries("no dictionary"));
+  EXPECT_TRUE(partly.bundleInfoDictionary().isDictionary());
+
+  EXPECT_NE(record(infoWith({{"Multiple", false}})), nullptr);
+  EXPECT_EQ(log.take(), Lines{"DEFAULT ops: multiplexed plug-ins (Multiple key) obsolete and ignored"});
+}
+
+TEST(XTPlugInCore, SetupTellsItsNameAtDebugLevel) {
+  tests::LogCapture log("debug");
+  const auto plugIn = record(infoWith({}));
+  EXPECT_EQ(log.take(), (Lines{"DEBUG ops: setDictionaries: MailFilter",
+                               "DEBUG ar: setupWithName:url:bundleInfo:info:uuid: MailFilter"}));
+  EXPECT_TRUE(plugIn->infoKey("Nowhere").isNothing());
+  EXPECT_EQ(log.take(), Lines{"DEBUG ar: infoKey: Nowhere => (null)"});
+}
+
+TEST(XTPlugInCore, IdentityIsTheUuidAlone) {
+  const auto a = record({});
+  const auto b = record({});
+  EXPECT_NE(*a, *b);
+  EXPECT_NE(a->uuid(), Uuid());
+  XTPlugInCore copy = *a;
+  copy.setIdentifier("com.example.other");
+  EXPECT_EQ(copy, *a);
+  EXPECT_EQ(copy.hash(), a->hash());
+}
+
+TEST(XTPlugInCore, InfoArgumentServesOnlyWithoutAnInfoPlist) {
+  const Dictionary given = {{"HXExtensionProtocol", "Given"}};
+  const auto without = XTPlugInCore::initWithName("a", kPlain, {}, given, std::nullopt);
+  EXPECT_EQ(without->protocolSpec(), Value("Given"));
+  EXPECT_TRUE(without->bundleInfoDictionary().isNothing());
+  const auto with = XTPlugInCore::initWithName("a", kPlain, infoWith({}), given, std::nullopt);
+  EXPECT_TRUE(with->protocolSpec().isNothing());
+}
+
+TEST(XTPlugInCore, AppExtensionsHaveDefaults) {
+  const auto extension = record(infoWith({}));
+  EXPECT_TRUE(extension->isAppExtension());
+  EXPECT_EQ(extension->protocolSpec(), Value("HXObject"));
+  EXPECT_EQ(extension->principalSpec(), Value("HXObject"));
+  EXPECT_EQ(extension->embeddedProtocolSpec(), Value("HXObject"));
+  for (const char* path : {"/P/Filter.APPEX", "/P/Filter.appex2", "/P/Filter.appex/inner"}) {
+    const auto other = record(infoWith({{"EmbeddedProtocol", "Inner"}}), Url::file(path));
+    EXPECT_FALSE(other->isAppExtension()) << path;
+    EXPECT_TRUE(other->protocolSpec().isNothing());
+    EXPECT_TRUE(other->principalSpec().isNothing());
+    EXPECT_EQ(other->embeddedProtocolSpec(), Value("Inner"));
+  }
+}
+
+TEST(XTPlugInCore, StylesAreReadFromTheMetadata) {
+  for (const auto& [protocol, data] : std::vector<std::pair<Value, bool>>{
+           {"#Data", true}, {"#data", false}, {"#Data ", false}, {Array{"#Data"}, false}, {{}, false}}) {
+    EXPECT_EQ(record(infoWith({{"HXExtensionProtocol", protocol}}))->isData(), data) << protocol.describe();
+  }
+  for (const auto& [dedicated, expected] : std::vector<std::pair<Value, bool>>{
+           {true, true}, {1, true}, {2.5, true}, {false, false}, {0, false}, {{}, false}, {"true", false}}) {
+    EXPECT_EQ(record(infoWith({{"Dedicated", dedicated}}))->isDedicated(), expected) << dedicated.describe();
+  }
+  EXPECT_TRUE(record(infoWith({{"EmbeddedCode", false}}))->isHybrid());
+  EXPECT_FALSE(record(infoWith({}))->isHybrid());
+
+  XTPlugInCore plugIn;
+  EXPECT_FALSE(plugIn.setDictionaries(Dictionary{{"Extora", 1}}));
+  EXPECT_TRUE(plugIn.oldStyle());
+  EXPECT_TRUE(plugIn.setDictionaries(Dictionary{{"Extora", 1}, {"HXExtension", Dictionary{}}}));
+  EXPECT_FALSE(plugIn.oldStyle());
+  plugIn.setBundleInfoDictionary({});
+  EXPECT_THROW((void)plugIn.oldStyle(), platform::InternalInconsistency);
+}
+
+TEST(XTPlugInCore, LookUpsThroughWrongKindsAnswerNothing) {
+  const auto plugIn = record(infoWith({{"HXExtensionAttributes", "text"}}));
+  EXPECT_TRUE(plugIn->attributes().isNothing());
+  EXPECT_TRUE(plugIn->attribute("HXExtensionVersion").isNothing());
+  EXPECT_EQ(plugIn->version(), std::nullopt);
+}
+
+TEST(XTPlugInCore, CanonicalizeCompletesTheVersion) {
+  const auto versionAfter = [](Dictionary plugIn, const Value& marketing) {
+    Dictionary info = infoWith(std::move(plugIn));
+    info.set("HBBundleShortVersionString", marketing);
+    const auto completed = record(info);
+    completed->canonicalize();
+    EXPECT_EQ(completed->bundleInfoDictionary(), Value(info));
+    return completed->version();
+  };
+  const Dictionary attributes = {{"HXExtensionVersion", "3.0"}, {"Other", 1}};
+  EXPECT_EQ(versionAfter({}, "2.1"), "2.1");
+  EXPECT_EQ(versionAfter({}, {}), "1");
+  EXPECT_EQ(versionAfter({{"HXExtensionAttributes", attributes}}, "2.1"), "3.0");
+
+  XTPlugInCore empty;
+  empty.canonicalize();
+  EXPECT_EQ(empty.plugInDictionary()["HXExtensionAttributes"]["HXExtensionVersion"], Value("1"));
+}
+
+TEST(XTPlugInCore, SetAnnotationReplacesTheDictionary) {
+  const auto plugIn = record({});
+  plugIn->setAnnotation("election", 1);
+  const Value before = plugIn->annotations();
+  plugIn->setAnnotation("extension", Dictionary{});
+  plugIn->setAnnotation("election", {});
+  EXPECT_EQ(before, Value(Dictionary{{"election", 1}}));
+  EXPECT_EQ(plugIn->annotations(), Value(Dictionary{{"extension", Dictionary{}}}));
+}
+
+TEST(XTPlugInCore, LocalizedInfoForHosts) {
+  tests::LogCapture log("default,ar=debug");
+  Value answer;
+  std::optional<Error> error;
+  const auto ask = [&](const XTPlugInCore& plugIn, const std::vector<std::string>& keys) {
+    int calls = 0;
+    plugIn.localizedInfoDictionaryForKeys(keys, [&](const Value& dictionary, const std::optional<Error>& problem) {
+      ++calls;
+      answer = dictionary;
+      error = problem;
+    });
+    EXPECT_EQ(calls, 1);
+    const Lines lines = log.take();
+    EXPECT_EQ(lines.back(), "DEBUG ar: localized values " + answer.describe());
+  };
+
+  ask(*record({}), {"HBBundleName"});
+  EXPECT_TRUE(answer.isNothing());
+  EXPECT_EQ(error, makeError(-1, "Unable to resolve plugin for com.example.filter"));
+
+  Dictionary info = infoWith({});
+  info.set("HBBundleName", "filter");
+  info.set("Odd", Uuid());
+  const auto plugIn = record(info);
+  ask(*plugIn, {"HBBundleDisplayName", "HBBundleName", "Nowhere"});
+  EXPECT_EQ(error, std::nullopt);
+  EXPECT_EQ(answer, Value(Dictionary{{"HBBundleDisplayName", "MailFilter"}, {"HBBundleName", "filter"}}));
+
+  plugIn->setLocalizedName("Mail Filter");
+  plugIn->setLocalizedShortName("Filter");
+  ask(*plugIn, {"HBBundleDisplayName", "HBBundleName"});
+  EXPECT_EQ(answer, Value(Dictionary{{"HBBundleDisplayName", "Mail Filter"}, {"HBBundleName", "Filter"}}));
+
+  ask(*plugIn, {"HBBundleName", "Odd"});
+  EXPECT_TRUE(answer.isNothing());
+  EXPECT_EQ(error, makeError(-1,
+                             "Value of info dictionary key \"Odd\" for plugin com.example.filter does not conform to "
+                             "secure coding!"));
+}
+
+// Extension points of the tests.
+class XTPlugInSDK : public testing::Test {
+ protected:
+  void SetUp() override {
+    XTPlugInCore::setSDKProvider([this](const std::string& point) { return sdks_[point]; });
+  }
+  void TearDown() override { XTPlugInCore::setSDKProvider(nullptr); }
+  std::shared_ptr<XTPlugInCore> resolved(Dictionary plugIn) {
+    auto result = record(infoWith(std::move(plugIn)), kPlain);
+    result->resolveSDK();
+    return result;
+  }
+  Dictionary sdks_;
+};
+
+TEST_F(XTPlugInSDK, FillsWhatThePlugInLacks) {
+  sdks_.set("com.example.point", infoWith({{"HXExtensionAttributes", Dictionary{{"A", 2}, {"B", 3}}},
+                                           {"HXExtensionProtocol", "P"},
+                                           {"CleanTimeout", 30},
+                                           {"Shared", Array{"y", "z"}},
+                                           {"List", Array{"sdk"}},
+                                           {"Clash", Dictionary{}},
+                                           {"Clash2", "text"}}));
+  const auto plugIn = resolved({{"HXExtensionPointIdentifier", "com.example.point"},
+                                {"HXExtensionAttributes", Dictionary{{"A", 1}}},
+                                {"CleanTimeout", 10},
+                                {"Shared", Array{"x", "y", "x"}},
+                                {"List", Array{"own"}},
+                                {"Clash", "own"},
+                                {"Clash2", Dictionary{}}});
+  EXPECT_EQ(plugIn->attributes(), Value(Dictionary{{"A", 1}, {"B", 3}, {"HXExtensionVersion", "1"}}));
+  EXPECT_EQ(plugIn->protocolSpec(), Value("P"));
+  EXPECT_EQ(plugIn->pluginKey("CleanTimeout"), Value(30));
+  EXPECT_EQ(plugIn->pluginKey("Shared"), Value(Array{"x", "y", "z"}));
+  EXPECT_EQ(plugIn->pluginKey("List"), Value(Array{"own"}));
+  EXPECT_EQ(plugIn->pluginKey("Clash"), Value("own"));
+  EXPECT_EQ(plugIn->pluginKey("Clash2"), Value(Dictionary{}));
+  EXPECT_EQ(plugIn->infoKey("HXExtension")["HXExtensionProtocol"], Value("P"));
+}
+
+TEST_F(XTPlugInSDK, BadOrUnknownKeys) {
+  tests::LogCapture log;
+  EXPECT_EQ(resolved({{"HXExtensionPointIdentifier", 7}})->version(), std::nullopt);
+  EXPECT_EQ(log.take(), Lines{"ERROR ops: invalid SDK key:7"});
+  EXPECT_EQ(resolved({{"HXExtensionPointIdentifier", "com.example.none"}})->version(), "1");
+  EXPECT_EQ(log.take(), Lines{"DEFAULT ops: plug-in sdk \"com.example.none\" not registered"});
+  EXPECT_EQ(resolved({})->version(), "1");
+  EXPECT_EQ(log.take(), Lines{});
+  EXPECT_THROW(XTPlugInCore().resolveSDK(), platform::InternalInconsistency);
+}
+
+TEST(XTDPlugInSignature, EachHasAHashOfItsOwn) {
+  const auto a = XTDPlugInSignature::initWithURL(kFilter, nullptr);
+  const auto b = XTDPlugInSignature::initWithURL(kFilter, nullptr);
+  EXPECT_EQ(a->cdhash().bytes().size(), 20U);
+  EXPECT_NE(a->cdhash(), b->cdhash());
+  EXPECT_EQ(a->requirement(), "dummy requirement");
+}
+
+}  // namespace
+}  // namespace extora
