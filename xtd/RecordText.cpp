@@ -28,4 +28,10 @@ std::string describeInstallation(const platform::ARExtoraProxy& record) {
                      orNull(record.bundleURL ? record.bundleURL->path() : ""));
 }
 
+std::string describePlugIns(const std::vector<std::shared_ptr<XTDPlugIn>>& plugIns) {
+  std::string text = "[";
+  for (const auto& plugIn : plugIns) text += (text.size() > 1 ? ", " : "") + plugIn->describe();
+  return text + "]";
+}
+
 }  // namespace extora

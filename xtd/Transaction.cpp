@@ -29,8 +29,11 @@ void brokenContract(const char* description) {
 
 std::span<const Transaction::Handler> Transaction::handlers() {
   static constexpr Handler table[] = {
-      {XTDMatchRequest, &Transaction::matchPlugIns},
-      {XTDFindRequest, &Transaction::findPlugIn},
+      {XTDAddRequest, &Transaction::addPlugIns},           {XTDRemoveRequest, &Transaction::removePlugIns},
+      {XTDBulkRequest, &Transaction::bulkPlugIns},         {XTDMatchRequest, &Transaction::matchPlugIns},
+      {XTDReadyRequest, &Transaction::readyPlugIns},       {XTDAccessRequest, &Transaction::accessPlugIns},
+      {XTDAnnotateRequest, &Transaction::annotatePlugIns}, {XTDBulkAnnotateRequest, &Transaction::bulkAnnotatePlugIns},
+      {XTDLockdownRequest, &Transaction::lockDownPlugIns}, {XTDFindRequest, &Transaction::findPlugIn},
   };
   return table;
 }
@@ -172,6 +175,7 @@ void Transaction::fail(std::uint64_t code, const Error& error) {
 
 void Transaction::finishForm(const XTDPlugIn& plugIn, platform::Dictionary& form) {
   addAnnotationForPlugIn(plugIn, form);
+  plugIn.augmentForm(*server().platformServices()->sandbox, form);
 }
 
 void Transaction::addAnnotationForPlugIn(const XTDPlugIn& plugIn, platform::Dictionary& form) {

@@ -69,6 +69,17 @@ class Transaction : public std::enable_shared_from_this<Transaction> {
   void findPlugIn();           // Transaction_Find.cpp
   void annotatePlugIns();      // Transaction_Annotations.cpp
   void bulkAnnotatePlugIns();  // Transaction_Annotations.cpp
+  void addPlugIns();           // Transaction_Registration.cpp
+  void removePlugIns();        // Transaction_Registration.cpp
+  void bulkPlugIns();          // Transaction_Registration.cpp
+  void lockDownPlugIns();      // Transaction_Holds.cpp
+  void readyPlugIns();         // Transaction_Activation.cpp
+  void accessPlugIns();        // Transaction_Activation.cpp
+
+  // Steps of handlers. What answers false has sent the failure.
+  bool collectPlugInsToHold(std::uint64_t flags, std::vector<std::shared_ptr<XTDPlugIn>>& plugIns);
+  bool noneIsBusy(const std::vector<std::shared_ptr<XTDPlugIn>>& plugIns);
+  bool mayBeReady(const XTDPlugIn& plugIn);
   std::shared_ptr<XTDPlugIn> findPlugInByUUID(const platform::Value& uuid);
   std::shared_ptr<XTDPlugIn> findPlugInByPathURL(const platform::Value& text);
   /// The request's "paths" when they are a list of `count` elements, parallel to its UUIDs; else nothing (logged unless

@@ -1,5 +1,8 @@
+#include <unordered_set>
+
 #include "Extora/XTLog.h"
 #include "Extora/XTVocabulary.h"
+#include "platform/value/PropertyListKinds.h"
 #include "xtd/Probes.h"
 #include "xtd/Transaction.h"
 #include "xtd/XTDIpcClient.h"

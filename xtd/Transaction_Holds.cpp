@@ -1,4 +1,5 @@
 #include "Extora/XTLog.h"
+#include "xtd/RecordText.h"
 #include "xtd/Transaction.h"
 #include "xtd/XTDIpcClient.h"
 #include "xtd/XTDServer.h"
@@ -19,7 +20,7 @@ void Transaction::lockDownPlugIns() {
   if (XTLogOps().enabled(platform::LogLevel::Info)) {
     XTLogOps().info("processing hold request for plug-ins:{}", describePlugIns(plugIns));
   }
-  if ((flags & XTHoldFlagRefuseBusy) != 0 && refuseBusy(plugIns)) return;
+  if ((flags & XTHoldFlagRefuseBusy) != 0 && !noneIsBusy(plugIns)) return;
 
   auto hold = std::make_shared<XTDPlugInHold>(plugIns, client_);
   const Uuid token = hold->uuid();
@@ -62,9 +63,9 @@ bool Transaction::collectPlugInsToHold(std::uint64_t flags, std::vector<std::sha
   });
 }
 
-// True when the request has been refused because some of `plugIns` are busy; every one of them is asked.
-bool Transaction::refuseBusy(const std::vector<std::shared_ptr<XTDPlugIn>>& plugIns) {
-  Array conflicts;
+// Every plug-in is asked; the first busy one does not end it.
+bool Transaction::noneIsBusy(const std::vector<std::shared_ptr<XTDPlugIn>>& plugIns) {
+  platform::Array conflicts;
   std::vector<std::shared_ptr<XTDPlugIn>> busy;
   for (const auto& plugIn : plugIns) {
     Value description = plugIn->checkBusy(*server().platformServices()->assertions);
@@ -72,13 +73,13 @@ bool Transaction::refuseBusy(const std::vector<std::shared_ptr<XTDPlugIn>>& plug
     busy.push_back(plugIn);
     conflicts.append(std::move(description));
   }
-  if (busy.empty()) return false;
+  if (busy.empty()) return true;
   if (XTLogOps().enabled(platform::LogLevel::Debug)) {
     XTLogOps().debug("hold refused. Busy plug-ins:{}", describePlugIns(busy));
   }
-  reply().set(XTDConflictsKey, conflicts);
+  reply().set(XTDConflictsKey, std::move(conflicts));
   fail(XTErrorBusy, "plug-ins are busy");
-  return true;
+  return false;
 }
 
 }  // namespace extora

@@ -30,6 +30,8 @@ class XTDIpcClient : public std::enable_shared_from_this<XTDIpcClient> {
   pid_t pid() const;
   /// The process id that the peer had when it connected, also after the connection has gone.
   pid_t originalPid() const { return peer_->pid(); }
+  /// The process at the other end, held by pidfd. Never null.
+  const std::shared_ptr<const platform::PeerIdentity>& peer() const { return peer_; }
   const std::string& path() const { return path_; }
   const std::shared_ptr<XTBundle>& bundle() const { return bundle_; }
   /// Null when it has gone.

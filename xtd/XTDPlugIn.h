@@ -11,8 +11,10 @@
 #include <string>
 
 #include "Extora/XTPlugInCore.h"
+#include "platform/assertions/ProcessAssertions.h"
 #include "platform/queue/Mutex.h"
 #include "platform/registry/ApplicationRegistry.h"
+#include "platform/sandbox/Sandbox.h"
 
 namespace extora {
 
@@ -80,6 +82,29 @@ class XTDPlugIn : public XTPlugInCore {
   /// The identifiers of the consent services that the user has granted to the containing application; empty without
   /// one, or when the consent service cannot answer (logged).
   std::set<std::string> allowedConsentServices() const;
+
+  // Activation (XTDPlugIn_Activation.cpp).
+  /// Registers the plug-in with the job manager for this very host, with the environment's entries (a dictionary, or
+  /// nothing); nothing on success, else an error of code 4.
+  std::optional<Error> enableForClient(XTDIpcClient& client, const Value& environment) const;
+  /// The name of the sandbox profile that follows from the plug-in's extension point.
+  const char* sandboxProfile() const;
+
+  // Sandbox extensions (XTDPlugIn_Sandbox.cpp). Tokens are issued afresh on every call.
+  /// Adds "extensions" and "service-extension" to an export form.
+  void augmentForm(platform::Sandbox& sandbox, Dictionary& form) const;
+  /// path -> token of a string or a list of strings, paths relative to the bundle; what cannot be served is logged and
+  /// left out.
+  Dictionary issueResourceExtensions(platform::Sandbox& sandbox, const Value& paths) const;
+  /// A read-only token for `location`, at or below the bundle; nothing and a system error number on failure.
+  std::optional<std::string> issueFileExtension(platform::Sandbox& sandbox, const Url& location,
+                                                int* errorNumber) const;
+  std::optional<std::string> issueServiceExtension(platform::Sandbox& sandbox, const std::string& name,
+                                                   int* errorNumber) const;
+
+  // Use (XTDPlugIn_Busy.cpp).
+  /// The description of the first busy instance, a dictionary of one entry; nothing when none is busy.
+  Value checkBusy(platform::ProcessAssertions& assertions) const;
 
  private:
   XTDPlugIn() = default;

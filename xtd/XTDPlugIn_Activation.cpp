@@ -3,6 +3,7 @@
 
 #include "Extora/XTBundle.h"
 #include "Extora/XTLog.h"
+#include "Extora/XTProtocol.h"
 #include "platform/jobs/JobManager.h"
 #include "xtd/XTDIpcClient.h"
 #include "xtd/XTDPlugIn.h"

@@ -100,7 +100,4 @@ void XTDServer::stop() {
   });
 }
 
-// Their cache entries are gone by now, and the daemon keeps nothing else of them.
-void XTDServer::removedPlugIns(const platform::PlugInRecords&) {}
-
 }  // namespace extora

@@ -38,6 +38,10 @@ class XTDServer : public XTDatabase, public XTDatabaseDelegate {
   void stop();
   void removedPlugIns(const platform::PlugInRecords& records) override;
 
+  /// Ends the running instances of `records` (XTDServer_Termination.cpp); returns at once. `reply` is called on a queue
+  /// of the termination once the job manager has answered for each, whatever the answers are.
+  void terminatePlugIns(const platform::PlugInRecords& records, std::function<void()> reply);
+
   // Holds (XTDServer_Holds.cpp).
   bool holdOnPlugIn(const XTDPlugIn& plugIn);
   void addHold(std::shared_ptr<XTDPlugInHold> hold);

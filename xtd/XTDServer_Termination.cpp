@@ -1,4 +1,5 @@
 #include "Extora/XTLog.h"
+#include "xtd/RecordText.h"
 #include "xtd/XTDServer.h"
 #include "xtd/XTDTermination.h"
 

@@ -52,6 +52,11 @@ class XTDatabase : public platform::RegistryObserver, public std::enable_shared_
   /// Posts the system-wide notification that hosts look again at.
   void notifyAnnotationChange();
 
+  // Registration (XTDatabase_Registration.cpp).
+  /// Has the registry register the bundle at `url`; nothing on success, else error 2.
+  [[nodiscard]] std::optional<Error> addPlugIn(const Url& url);
+  [[nodiscard]] std::optional<Error> removePlugIn(const Url& url);
+
   // Registry observer (XTDatabase_Registration.cpp).
   void pluginsDidInstall(const platform::PlugInRecords& records) override;
   void pluginsWillUninstall(const platform::PlugInRecords& records) override;

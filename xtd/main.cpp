@@ -9,6 +9,7 @@
 #include "Extora/XTLog.h"
 #include "Extora/XTProtocol.h"
 #include "platform/Platform.h"
+#include "platform/hostservices/HostServices.h"
 #include "platform/queue/MainRunLoop.h"
 #include "xtd/XTDServer.h"
 
@@ -97,6 +98,9 @@ int main(int argc, char* argv[]) {
   }
   server->setVerbose(options.verbose);
   server->setCacheLimit(options.cacheLimit);
+  const auto& platform = *server->platformServices();
+  const auto hostServices = platform::HostServices::make({platform.directories, platform.jobs, platform.sandbox});
+  if (hostServices != nullptr) hostServices->resume();
   // Runs once the loop does: the listener has been resumed by then.
   MainRunLoop::main().async([] { (void)sd_notify(0, "READY=1"); });
   server->run();

@@ -114,9 +114,8 @@ TEST_F(DiscoveryTest, OverriderAndOverriddenNameEachOther) {
   EXPECT_EQ(forms["com.example.q"]["overrider"].string(), forms["com.example.p"]["uuid"].string());
   EXPECT_EQ(forms["com.example.p"]["overriding"].string(), "com.example.q");
   for (const char* key : {"overrider", "overriding"}) EXPECT_TRUE(forms["com.example.r"][key].isNothing());
-  EXPECT_EQ(daemon_.countInLog("INFO ops: plug-in " + forms["com.example.p"]["uuid"].string() + " overrides " +
-                               forms["com.example.q"]["uuid"].string() + "\n"),
-            1U);
+  EXPECT_TRUE(daemon_.waitForLog("INFO ops: plug-in " + forms["com.example.p"]["uuid"].string() + " overrides " +
+                                 forms["com.example.q"]["uuid"].string() + "\n"));
 }
 
 TEST_F(DiscoveryTest, AHostInAnApplicationIsOfferedItsOwnPlugIns) {

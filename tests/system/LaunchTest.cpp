@@ -193,9 +193,8 @@ TEST_F(LaunchTest, SeesItsOwnAndTheSystemAndNothingElse) {
   EXPECT_TRUE(fs::exists(container() + "/new"));
   EXPECT_EQ(probe->open("/tmp/extora-probe", create), 0);
   EXPECT_FALSE(fs::exists("/tmp/extora-probe")) << "its /tmp is private";
-  for (const std::string& outside :
-       {(place_.root() / "secret").string(), std::string("/etc/passwd"), place_.applications() / "app.app/Info.plist",
-        (place_.state() / "lock").string(), std::string("/root"), std::string("/home")}) {
+  for (const fs::path& outside : {place_.root() / "secret", fs::path("/etc/passwd"), fs::path("/root"),
+                                  place_.applications() / "app.app/Info.plist", place_.state() / "lock"}) {
     EXPECT_EQ(probe->open(outside), ENOENT) << outside;
   }
   const auto socket = [&](const char* service) { return place_.socket(service).string(); };

@@ -14,6 +14,7 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <utility>
 
 #include "platform/ipc/IpcServiceAddress.h"
 #include "tests/support/ChildProcess.h"
@@ -101,7 +102,7 @@ TEST_F(IpcListenerTest, ANameIsServedByOneAndFreeAgainAfterwards) {
   EXPECT_EQ(modeOf(socketPath()), 0666U);
   EXPECT_EQ(modeOf(socketPath().parent_path()), 0755U);
   EXPECT_EQ(ask(runtime_), "ok");
-  EXPECT_EQ(accepted_.now().at(0)->peerPid(), ::getpid());
+  EXPECT_EQ(accepted_.now().at(0)->peer()->pid(), ::getpid());
 
   EXPECT_EQ(ipcCreateListener(runtime_, kService, queue_, &error_), nullptr);
   EXPECT_NE(error_.describe().find("is already served"), std::string::npos) << error_.describe();
@@ -154,19 +155,19 @@ TEST_F(IpcListenerTest, PathsTooLongForASocketAddressAndWrongNames) {
   runtime_ = outer;
 }
 
-// Runs in the process that ActivationSocketsAreUsedAndStay has started.
-TEST_F(IpcListenerTest, DISABLED_ServeAnActivationSocket) {
-  ::setenv("LISTEN_PID", std::to_string(::getpid()).c_str(), 1);
-  runtime_ = std::getenv("TEST_RUNTIME");
-  ASSERT_TRUE(serve()) << error_.describe();
-  EXPECT_EQ(ask(runtime_), "ok");
-  EXPECT_EQ(accepted_.now().size(), 2U);  // with the one that came before
-  listener_->cancel();
-  EXPECT_TRUE(fs::is_socket(socketPath()));
-  runtime_ += "/none";  // the directory is the parent's to remove
-}
-
 TEST_F(IpcListenerTest, ActivationSocketsAreUsedAndStay) {
+  // The activated service is this test again, in a process of its own.
+  if (const char* runtime = std::getenv("TEST_ACTIVATED_RUNTIME")) {
+    const std::string own = std::exchange(runtime_, runtime);
+    ::setenv("LISTEN_PID", std::to_string(::getpid()).c_str(), 1);
+    ASSERT_TRUE(serve()) << error_.describe();
+    EXPECT_EQ(ask(runtime_), "ok");
+    EXPECT_EQ(accepted_.now().size(), 2U);  // with the one that came before
+    listener_->cancel();
+    EXPECT_TRUE(fs::is_socket(socketPath()));
+    runtime_ = own;
+    return;
+  }
   fs::create_directories(socketPath().parent_path());
   const UniqueFd socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
   const auto address = IpcServiceAddress::make(ipcServicesDirectory(runtime_), kService, nullptr);
@@ -178,12 +179,11 @@ TEST_F(IpcListenerTest, ActivationSocketsAreUsedAndStay) {
   if (child == 0) {
     ::setenv("LISTEN_FDS", "2", 1);
     ::setenv("LISTEN_FDNAMES", (std::string("com.example.else:") + kService).c_str(), 1);
-    ::setenv("TEST_RUNTIME", runtime_.c_str(), 1);
+    ::setenv("TEST_ACTIVATED_RUNTIME", runtime_.c_str(), 1);
     const int copy = ::fcntl(socket.get(), F_DUPFD, 10);
     ::dup2(STDERR_FILENO, 3);
     ::dup2(copy, 4);
-    ::execl("/proc/self/exe", "test", "--gtest_also_run_disabled_tests",
-            "--gtest_filter=IpcListenerTest.DISABLED_ServeAnActivationSocket", nullptr);
+    ::execl("/proc/self/exe", "test", "--gtest_filter=IpcListenerTest.ActivationSocketsAreUsedAndStay", nullptr);
     ::_exit(127);
   }
   int status = -1;
