@@ -157,7 +157,7 @@ class CandidateFilter {
     if (const auto& bundle = client.bundle()) plugInsPath_ = bundle->plugInsPath();
   }
 
-  bool accepts(const XTDPlugIn& plugIn) const {
+  bool accepts(const XTDPlugIn& plugIn) {
     const bool all = (flags_ & XTDiscoverAll) != 0;
     if (!all && !isOfferedToHost(plugIn)) return false;
     if (!plugIn.match(rules_)) return false;
@@ -166,7 +166,8 @@ class CandidateFilter {
       return false;
     }
     if (all) return true;
-    const auto refusal = plugIn.allowForClient(client_);
+    if (!restriction_) restriction_ = client_.entitlementValueForKey(std::string(XTAllowedPlugInsEntitlement));
+    const auto refusal = plugIn.allowForClient(client_, *restriction_);
     if (refusal) XTLogOps().info("client {} cannot use plugin {}: {}", client_.pid(), plugIn.uuid(), *refusal);
     return !refusal;
   }
@@ -191,6 +192,7 @@ class CandidateFilter {
   const Value& rules_;
   const std::uint64_t flags_;
   const Value exclusions_;
+  std::optional<Value> restriction_;        // of the client, once the request has come to need it
   std::optional<std::string> plugInsPath_;  // of the client's bundle
 };
 
@@ -222,7 +224,7 @@ void Transaction::matchPlugIns() {
     fail(XTErrorNotPermitted, "unauthorized discovery flag (XTDiscoverAll)");
     return;
   }
-  const CandidateFilter filter(server(), *client_, query, flags);
+  CandidateFilter filter(server(), *client_, query, flags);
   PlugIns candidates = server().findPlugIns(query).value_or(PlugIns());
   probes::discoverRaw(static_cast<unsigned>(candidates.size()));
   logCount("Candidate", "info", candidates, [](const auto& plugIn) -> Value {

@@ -77,6 +77,9 @@ class XTDPlugIn : public XTPlugInCore {
   // Host access (XTDPlugIn_Access.cpp).
   /// The reason why the host may not use this plug-in, or nothing when it may.
   std::optional<std::string> allowForClient(XTDIpcClient& client) const;
+  /// The same with the host's restriction entitlement (or nothing) already at hand, for a request that asks about many
+  /// plug-ins: looking an entitlement up costs some 50 system calls.
+  std::optional<std::string> allowForClient(XTDIpcClient& client, const Value& restriction) const;
 
   // Privacy consent (XTDPlugIn_Consent.cpp).
   /// The identifiers of the consent services that the user has granted to the containing application; empty without

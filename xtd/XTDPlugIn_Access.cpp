@@ -5,7 +5,10 @@
 namespace extora {
 
 std::optional<std::string> XTDPlugIn::allowForClient(XTDIpcClient& client) const {
-  const Value restriction = client.entitlementValueForKey(std::string(XTAllowedPlugInsEntitlement));
+  return allowForClient(client, client.entitlementValueForKey(std::string(XTAllowedPlugInsEntitlement)));
+}
+
+std::optional<std::string> XTDPlugIn::allowForClient(XTDIpcClient& client, const Value& restriction) const {
   if (restriction && !restriction.isDictionary()) return "invalid host restriction entitlement";
   if (!match(restriction)) return "the host's plug-in entitlement does not allow this plug-in";
   const Value required = pluginKey(XTHostEntitlementInfoKey);

@@ -10,6 +10,7 @@
 
 #include <array>
 #include <cerrno>
+#include <cstdint>
 
 #include "platform/files/UniqueFd.h"
 #include "platform/launch/LaunchProtocol.h"
@@ -23,6 +24,9 @@ static_assert(kAside > launch::kFirstFreeDescriptor);
 
 constexpr mode_t kUmask = 022;
 
+// At least as large as the kernel's own structure; all zero it is the default action.
+using KernelSignalAction = std::array<std::uint64_t, 8>;
+
 using Descriptors = std::array<UniqueFd, launch::kFirstFreeDescriptor>;
 
 // Raw calls: the library's own would change the other threads too, which the new process does not have.
@@ -35,7 +39,11 @@ bool become(const UserAndGroup& user) {
 // In the new process, which has one thread of many: nothing but system calls.
 [[noreturn]] void runBubblewrap(const BubblewrapStart& start, const Descriptors& descriptors, pid_t parent) {
   (void)::setsid();
-  for (int signal = 1; signal < NSIG; ++signal) (void)::signal(signal, SIG_DFL);
+  // All of them, also those that the library keeps for itself and that whoever started this process may have ignored.
+  const KernelSignalAction standard = {};
+  for (int signal = 1; signal < NSIG; ++signal) {
+    (void)::syscall(SYS_rt_sigaction, signal, &standard, nullptr, (NSIG - 1) / 8);
+  }
   sigset_t none;
   sigemptyset(&none);
   (void)::sigprocmask(SIG_SETMASK, &none, nullptr);

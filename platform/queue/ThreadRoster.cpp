@@ -3,9 +3,35 @@
 #include <pthread.h>
 #include <signal.h>
 
+#include <cstdlib>
 #include <system_error>
+#include <vector>
 
 namespace platform {
+namespace {
+
+struct Rosters {
+  Mutex mutex;
+  std::vector<ThreadRoster*> all XT_GUARDED_BY(mutex);
+};
+
+Rosters& rosters() {
+  static auto* const instance = new Rosters;
+  return *instance;
+}
+
+void reapAll() {
+  MutexLock lock(rosters().mutex);
+  for (ThreadRoster* roster : rosters().all) roster->reap();
+}
+
+}  // namespace
+
+ThreadRoster::ThreadRoster(std::string name) : name_(std::move(name)) {
+  MutexLock lock(rosters().mutex);
+  if (rosters().all.empty()) (void)std::atexit(&reapAll);
+  rosters().all.push_back(this);
+}
 
 bool ThreadRoster::start(std::function<void()> body) {
   reap();

@@ -1,7 +1,8 @@
 // ThreadRoster: the threads of a pool, started on demand and joined after they have retired; none is ever detached.
 //
 // Threads start with all signals blocked, so that a program that uses the library keeps its signals on its own threads.
-// Callable from any thread. A roster lives as long as the process: threads that still run are never joined.
+// Callable from any thread. A roster lives as long as the process; at its exit the threads that have ended are joined,
+// and those that still run are not.
 #pragma once
 
 #include <cstddef>
@@ -17,7 +18,7 @@ namespace platform {
 class ThreadRoster {
  public:
   /// `name` (at most 15 bytes) is what a debugger shows for each thread.
-  explicit ThreadRoster(std::string name) : name_(std::move(name)) {}
+  explicit ThreadRoster(std::string name);
 
   /// Starts a thread that runs `body`; false when the system gives none. `body` may end at any time.
   [[nodiscard]] bool start(std::function<void()> body);

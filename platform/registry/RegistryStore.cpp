@@ -21,6 +21,7 @@ namespace platform {
 namespace {
 
 constexpr int kVersion = 1;
+constexpr std::size_t kManyRegistrations = 500;
 
 constexpr const char* kSchema =
     "BEGIN;"
@@ -164,9 +165,8 @@ bool RegistryStore::load(StoredRegistry& stored) {
     const auto expected = digestOf(kind, key, content);
     if (!std::equal(digest.begin(), digest.end(), expected.begin(), expected.end())) return false;
     if (kind == kRegistration) {
-      auto registration = BundleRegistration::decode(key, content);
-      if (registration == nullptr) return false;
-      stored.registrations.emplace(key, std::move(registration));
+      // Larger than the codec takes back: the bundle is read again, which is no damage.
+      if (auto registration = BundleRegistration::decode(key, content)) stored.registrations.emplace(key, registration);
     } else {
       const Value value = decodeValue(content, nullptr);
       if (kind == kContainer) {
@@ -190,7 +190,11 @@ void RegistryStore::setAside() {
 
 bool RegistryStore::write(const StoreChange& change) {
   if (!database_ || change.empty()) return true;
-  if (execute("BEGIN IMMEDIATE") && writeAll(change) && execute("COMMIT")) return true;
+  if (execute("BEGIN IMMEDIATE") && writeAll(change) && execute("COMMIT")) {
+    // A long log would be read whole by the next start.
+    if (change.registrations.size() > kManyRegistrations) (void)execute("PRAGMA wal_checkpoint(TRUNCATE)");
+    return true;
+  }
   registryLog().error("registry database {} cannot be written: {}", path_, lastError());
   (void)execute("ROLLBACK");
   return false;

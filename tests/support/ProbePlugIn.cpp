@@ -1,9 +1,8 @@
 // probe_plugin: a plug-in that says what it can see and do. Started in a sandbox it answers its host's requests, each a
 // map with "ask"; on SIGTERM it writes the file "terminated" into its home and ends with status 0.
 //
-//   report                   environment, descriptors, processes, status and mounts (files of /proc), interfaces, ids
-//   open PATH FLAGS          -> "errno" of opening it
-//   connect PATH, tcp PORT   -> "errno" of connecting
+//   report                   environment, descriptors, processes, status and libraries (files of /proc), interfaces,
+//   ids open PATH FLAGS          -> "errno" of opening it connect PATH, tcp PORT   -> "errno" of connecting
 //   user-namespace           -> "errno" of making one
 //   begin, end               activity -> "errno"
 //   ignore-term              from here on SIGTERM has no effect
@@ -80,20 +79,15 @@ Dictionary report() {
   struct if_nameindex* const list = ::if_nameindex();
   for (auto* each = list; each != nullptr && each->if_index != 0; ++each) interfaces.append(each->if_name);
   ::if_freenameindex(list);
-  sigset_t mask;
-  ::sigprocmask(SIG_SETMASK, nullptr, &mask);
   return {{"environment", environment},
           {"descriptors", descriptors},
           {"processes", processes},
           {"interfaces", interfaces},
           {"status", textOf("/proc/self/status")},
-          {"mounts", textOf("/proc/self/mountinfo")},
           {"libraries", textOf("/proc/self/maps")},
           {"first", textOf("/proc/1/environ")},
-          {"root", namesIn("/")},
           {"uid", static_cast<std::int64_t>(::getuid())},
-          {"session", static_cast<std::int64_t>(::getsid(0))},
-          {"term-blocked", ::sigismember(&mask, SIGTERM) == 1}};
+          {"session", static_cast<std::int64_t>(::getsid(0))}};
 }
 
 int connectTo(const std::string& path) {

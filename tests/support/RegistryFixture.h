@@ -21,14 +21,33 @@
 
 namespace tests {
 
-class SettableLocale : public FakeLocale {
+/// A locale with one observer at a time.
+class SettableLocale : public platform::Locale {
  public:
   std::string current() override { return lang; }
+  std::unique_ptr<Observation> observe(std::function<void()> handler) override {
+    class Ending : public Observation {
+     public:
+      explicit Ending(std::function<void()>& observer) : observer_(observer) {}
+      ~Ending() override { observer_ = nullptr; }
+      Ending(const Ending&) = delete;
+      Ending& operator=(const Ending&) = delete;
+
+     private:
+      std::function<void()>& observer_;
+    };
+    observer_ = std::move(handler);
+    return std::make_unique<Ending>(observer_);
+  }
+  void startWatching() override {}
   void changeTo(const std::string& other) {
     lang = other;
-    change();
+    observer_();
   }
   std::string lang = "C";
+
+ private:
+  std::function<void()> observer_;
 };
 
 /// Writes down what it is told, one text a call: "-a b" or "+a b" with the identifiers, sorted.
