@@ -26,10 +26,12 @@ struct Shared {
   platform::SerialQueue events{"host_services"};
 };
 
-std::shared_ptr<IpcConnection> sharedConnection() {
+// `made` says whether it was made just now.
+std::shared_ptr<IpcConnection> sharedConnection(bool* made) {
   static auto* const shared = new Shared;
   const platform::MutexLock lock(shared->mutex);
-  if (shared->connection == nullptr || !shared->connection->isValid()) {
+  *made = shared->connection == nullptr || !shared->connection->isValid();
+  if (*made) {
     const std::string runtime = platform::Directories::forClient(platform::kHostServices).runtime;
     shared->connection = platform::ipcConnectService(runtime, platform::kHostServices, shared->events);
     shared->connection->setEventHandler([](const platform::IpcEvent&) {});  // requests come back with what is wrong
@@ -40,7 +42,11 @@ std::shared_ptr<IpcConnection> sharedConnection() {
 
 // The answer, or nothing and `error`.
 Value ask(const Dictionary& request, Error* error) {
-  platform::IpcReplyObject reply = sharedConnection()->sendWithReplySync(request);
+  bool made = false;
+  platform::IpcReplyObject reply = sharedConnection(&made)->sendWithReplySync(request);
+  // That the service has been started anew since the last request shows with the next one. What the one before had
+  // begun ended with it.
+  if (reply.error && !made) reply = sharedConnection(&made)->sendWithReplySync(request);
   if (reply.error) {
     platform::setError(error, {"POSIX", ENOTCONN, reply.error->describe()});
     return {};

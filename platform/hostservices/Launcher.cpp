@@ -272,6 +272,8 @@ void Launcher::handleLastWord(Child& child) {
   const ssize_t size = ::recv(child.control.get(), &number, sizeof number, MSG_DONTWAIT);
   child.state = State::Over;
   child.control.reset();
+  child.complaints.reset();
+  child.firstProcess.reset();
   const Done done = std::exchange(child.done, nullptr);
   if (size == sizeof number && number != 0) {
     const std::string reason = std::string("it cannot be executed: ") + std::strerror(number);

@@ -102,7 +102,7 @@ void IpcSocketConnection::sendWithReply(const Value& body, const SerialQueue& qu
     error = checkUsable();
     if (!error) {
       id = ++lastId_;
-      pending_.emplace(id, Pending{self(), QueueReference(queue), std::move(reply)});
+      pending_.emplace(id, Pending{self(), QueueReference(queue), reply});
       if (claim_ == Claim::Resting && waiters_.empty()) arm();
     }
   }

@@ -100,7 +100,7 @@ MainRunLoop::MainRunLoop() : state_(std::make_unique<State>()) {
         "sd_event_add_io");
 }
 
-MainRunLoop& MainRunLoop::main() {
+MainRunLoop& MainRunLoop::main() {  // NOLINT(bugprone-exception-escape): no program entry
   static auto* const loop = new MainRunLoop;
   return *loop;
 }
@@ -135,8 +135,8 @@ std::unique_ptr<MainRunLoop::Source> MainRunLoop::addTimer(std::uint64_t interva
   auto source = std::make_unique<EventSource>();
   source->handler = std::move(handler);
   source->interval = intervalMs * kMicrosecondsPerMillisecond;
-  check(sd_event_add_time_relative(state_->loop, &source->source, CLOCK_MONOTONIC, source->interval, kTimerAccuracy, &onTimer,
-                                   source.get()),
+  check(sd_event_add_time_relative(state_->loop, &source->source, CLOCK_MONOTONIC, source->interval, kTimerAccuracy,
+                                   &onTimer, source.get()),
         "sd_event_add_time_relative");
   return source;
 }

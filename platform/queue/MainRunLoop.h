@@ -19,7 +19,7 @@ class MainRunLoop {
   };
 
   /// The loop of the main thread; made on the first call.
-  static MainRunLoop& main();
+  static MainRunLoop& main();  // NOLINT(bugprone-exception-escape): no program entry
 
   /// Blocks SIGTERM, SIGINT, SIGHUP and SIGCHLD for this thread and all that it starts; ignores SIGPIPE.
   static void blockSignals();

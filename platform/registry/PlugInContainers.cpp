@@ -1,5 +1,6 @@
 #include "platform/registry/PlugInContainers.h"
 
+#include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/stat.h>
 
@@ -63,10 +64,12 @@ std::string PlugInContainers::nameFor(const std::string& identifier, const std::
 
 // Asking the service costs a dozen system calls, which thousands of plug-ins need not pay at every start.
 bool PlugInContainers::isFittedOut(const std::string& name) const {
+  const auto look = [&](const std::string& path, struct stat& status) {
+    return ::fstatat(opened_.get(), path.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0;
+  };
   struct stat status {};
-  const std::string path = folder_ + "/" + name;
-  return right_ && ::lstat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode) && status.st_uid == right_->user &&
-         status.st_mode == right_->mode && exists(path + "/tmp");
+  return right_ && look(name, status) && status.st_uid == right_->user && status.st_mode == right_->mode &&
+         look(name + "/tmp", status);
 }
 
 std::string PlugInContainers::containerFor(const BundleRegistration& plugIn, const BundleRegistration* application) {
@@ -83,6 +86,7 @@ std::string PlugInContainers::containerFor(const BundleRegistration& plugIn, con
                         posixError(number, "the container service"));
     return {};
   }
+  if (!opened_) opened_.reset(::open(folder_.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
   struct stat status {};
   if (::lstat(path->c_str(), &status) == 0) right_ = {status.st_uid, status.st_mode};
   return *path;

@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "platform/container/Containers.h"
+#include "platform/files/UniqueFd.h"
 #include "platform/registry/BundleRegistration.h"
 #include "platform/registry/RegistryStore.h"
 
@@ -39,6 +40,7 @@ class PlugInContainers {
 
   const std::shared_ptr<Containers> containers_;
   const std::string folder_;
+  UniqueFd opened_;  // the folder; empty until the first container has been made
   std::unordered_map<std::string, std::vector<ContainerOwner>> owners_;  // by plug-in identifier, by number
   std::vector<ContainerOwner> changed_;
   // User and mode of a container that the service has just set right; nothing before that.

@@ -19,12 +19,14 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <future>
 #include <iterator>
+#include <string_view>
 
 #include "Extora/XTHostServices.h"
 #include "platform/ipc/IpcConnection.h"
@@ -136,6 +138,17 @@ Dictionary serve(const Value& request) {
   return {{"errno", number}};
 }
 
+int launch(const char* executable, bool untilReady) {
+  extora::Error error;
+  std::optional<extora::XTHostServices::Launched> launched;
+  do {
+    launched = extora::XTHostServices::launch(executable, &error);
+  } while (untilReady && !launched && error.code == EPERM);
+  if (!launched) return static_cast<int>(error.code);
+  std::printf("%d\n", static_cast<int>(launched->pid));
+  return 0;
+}
+
 // Where SIGTERM leaves its trace; made before the handler is set.
 std::string terminatedPath;
 
@@ -147,10 +160,7 @@ void terminated(int) {
 }  // namespace
 
 int main(int argc, char* argv[]) {
-  if (argc == 3) {
-    extora::Error error;
-    return extora::XTHostServices::launch(argv[2], &error) ? 0 : static_cast<int>(error.code);
-  }
+  if (argc == 3) return launch(argv[2], argv[1] == std::string_view("launch-when-ready"));
   listDescriptors();
   if (const char* home = std::getenv("HOME")) terminatedPath = std::string(home) + "/terminated";
   ::signal(SIGTERM, terminated);

@@ -19,7 +19,6 @@ using platform::Bytes;
 using platform::Dictionary;
 using platform::IpcFrameHeader;
 using platform::Value;
-using tests::Client;
 using tests::Daemon;
 
 const Dictionary kFind = {{"request", "find"}, {"version", std::uint64_t{3}}};

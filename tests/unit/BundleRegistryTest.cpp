@@ -13,7 +13,6 @@ namespace {
 
 namespace fs = std::filesystem;
 using tests::installBundle;
-using tests::removeBundle;
 using tests::sampleApplication;
 using tests::SampleBundle;
 using tests::samplePlugIn;
