@@ -63,7 +63,7 @@ std::string home() {
   return "/";
 }
 
-// The XDG base directory; one that is not absolute is ignored, as its specification asks.
+// The XDG base directory; one that is not absolute is ignored, as its definition asks.
 std::string xdg(const char* name, const std::string& preset) {
   const auto value = variable(name);
   return value && value->starts_with('/') ? absolute(*value) : preset;

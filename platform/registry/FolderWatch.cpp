@@ -133,6 +133,7 @@ void FolderWatch::decode(const Event& event, Batch& batch) {
         break;
       case Role::Kind::Folder:
         if ((event.mask & (kSelf | IN_UNMOUNT)) != 0) batch.everything = true;
+        batch.folders.insert(role.path);
         if (event.name.empty()) break;
         Change& change = batch.changes[role.path + "/" + event.name];
         change.left = change.left || (event.mask & (IN_MOVED_FROM | IN_DELETE)) != 0;

@@ -10,6 +10,7 @@
 #include <functional>
 #include <map>
 #include <memory>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -29,6 +30,7 @@ class FolderWatch {
   };
   struct Batch {
     std::map<std::string, Change> changes;  ///< by path of a bundle
+    std::set<std::string> folders;          ///< those that anything happened in
     bool everything = false;                ///< events were lost or folders came or went: call refresh(), look at all
     bool due = false;                       ///< the time of wakeAt() has come
     bool poll = false;                      ///< watches have run out, and two seconds have passed

@@ -24,7 +24,7 @@ int main(int argc, char** argv) {
   for (const auto& path : inputs) {
     std::printf("%s\n", path.c_str());
     std::fflush(stdout);  // the name of the input that ends the process is the one to see
-    std::ifstream file(path, std::ios::binary);
+    std::ifstream file(path, std::fstream::binary);
     const std::vector<char> bytes((std::istreambuf_iterator<char>(file)), std::istreambuf_iterator<char>());
     // A buffer of exactly this size, so that a sanitizer sees a read past its end; never null.
     std::vector<std::uint8_t> input(bytes.begin(), bytes.end());

@@ -153,7 +153,7 @@ std::string Daemon::askAsHost(const std::filesystem::path& executable, std::uint
 }
 
 std::uint64_t Daemon::notificationCount(const std::string& name) const {
-  std::ifstream file(runtime() / "notify" / name, std::ios::binary);
+  std::ifstream file(runtime() / "notify" / name, std::fstream::binary);
   unsigned char bytes[8] = {};
   EXPECT_TRUE(file.read(reinterpret_cast<char*>(bytes), sizeof bytes)) << "no notification " << name;
   std::uint64_t count = 0;

@@ -30,7 +30,7 @@ void makeFolder(const std::string& path) {
 }
 
 void writeFile(const std::string& path, const std::string& content, fs::perms mode) {
-  std::ofstream file(path, std::ios::binary | std::ios::trunc);
+  std::ofstream file(path, std::fstream::binary | std::fstream::trunc);
   file << content;
   file.close();
   if (!file) throw std::runtime_error("cannot write " + path);

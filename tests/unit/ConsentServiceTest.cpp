@@ -30,7 +30,7 @@ class ConsentServiceTest : public ::testing::Test {
         platform::plugInRecord(platform_.registry->install(application, {tests::sampleRecord("com.a")}), 0));
   }
   static void write(const std::string& path, const std::string& body) {
-    std::ofstream(path, std::ios::trunc) << "<plist version=\"1.0\">" << body << "</plist>";
+    std::ofstream(path, std::fstream::trunc) << "<plist version=\"1.0\">" << body << "</plist>";
   }
   void consents(const std::string& body) { write(platform_.directory.path("consent.plist"), body); }
 

@@ -192,6 +192,9 @@ TEST_F(IpcListenerTest, ActivationSocketsAreUsedAndStay) {
 }
 
 TEST_F(IpcListenerTest, WhenDescriptorsRunOutAcceptingWaitsAndGoesOn) {
+#ifdef __SANITIZE_ADDRESS__
+  GTEST_SKIP() << "the sanitizers look at memory through a pipe, for which no descriptor is left here";
+#endif
   tests::LogCapture log;
   ASSERT_TRUE(serve()) << error_.describe();
   const UniqueFd lowestFree(::open("/dev/null", O_RDONLY | O_CLOEXEC));

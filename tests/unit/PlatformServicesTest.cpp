@@ -123,7 +123,7 @@ TEST_F(PlatformServicesTest, NoPostOfSeveralProcessesIsLost) {
 
   const std::string path = directories_.runtime + "/notify/com.example.change";
   EXPECT_EQ(modeOf(path), 0644U);
-  std::ifstream file(path, std::ios::binary);
+  std::ifstream file(path, std::fstream::binary);
   const std::string bytes((std::istreambuf_iterator<char>(file)), {});
   EXPECT_EQ(bytes, std::string("\xB0\x04\0\0\0\0\0\0", 8)) << "1,200, little-endian";
 }

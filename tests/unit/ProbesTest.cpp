@@ -15,7 +15,7 @@ namespace {
 
 std::string fileBytes(const char* path) {
   std::string bytes(std::filesystem::file_size(path), '\0');
-  std::ifstream(path, std::ios::binary).read(bytes.data(), static_cast<std::streamsize>(bytes.size()));
+  std::ifstream(path, std::fstream::binary).read(bytes.data(), static_cast<std::streamsize>(bytes.size()));
   return bytes;
 }
 

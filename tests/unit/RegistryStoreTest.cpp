@@ -30,12 +30,12 @@ class RegistryStoreTest : public ::testing::Test {
     return bundle;
   }
   std::string content() {
-    std::ifstream file(path_, std::ios::binary);
+    std::ifstream file(path_, std::fstream::binary);
     return {std::istreambuf_iterator<char>(file), {}};
   }
   void setContent(const std::string& bytes) {
     for (const char* suffix : {"-wal", "-shm"}) fs::remove(path_ + suffix);
-    std::ofstream(path_, std::ios::binary | std::ios::trunc) << bytes;
+    std::ofstream(path_, std::fstream::binary | std::fstream::trunc) << bytes;
   }
 
   tests::TemporaryDirectory directory_;

@@ -85,11 +85,11 @@ class XTDAnnotationStoreTest : public ::testing::Test {
   }
   std::unique_ptr<XTDAnnotationStore> open() { return open(path_); }
   static void write(const std::string& path, std::string_view text) {
-    std::ofstream(path, std::ios::binary | std::ios::trunc) << text;
+    std::ofstream(path, std::fstream::binary | std::fstream::trunc) << text;
   }
   static std::string read(const std::string& path) {
     std::ostringstream text;
-    text << std::ifstream(path, std::ios::binary).rdbuf();
+    text << std::ifstream(path, std::fstream::binary).rdbuf();
     return text.str();
   }
 
