@@ -218,7 +218,7 @@ int Launcher::prepare(const Order& order, Child& child, std::string* reason) {
   child.complaints.reset(::memfd_create("complaints", MFD_CLOEXEC));
   if (!null || !plan || !options || !child.complaints || !makePair(SOCK_STREAM, &child.connection, &connection) ||
       !makePair(SOCK_SEQPACKET, &child.control, &control)) {
-    return errno;
+    return errno != 0 ? errno : EIO;
   }
   BubblewrapStart start;
   start.program = programs_.bubblewrap.c_str();

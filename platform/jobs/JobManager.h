@@ -60,7 +60,7 @@ class JobManager {
   virtual void jobRemoveExternalService(const std::string& bundleIdentifier, const std::string& version,
                                         std::shared_ptr<SerialQueue> queue, std::function<void(int)> answer) = 0;
 
-  /// The running instances of a bundle identifier (every one for an empty identifier), oldest first.
+  /// The running instances of a bundle identifier (which may be empty: of bundles that have none), oldest first.
   virtual std::vector<Instance> instances(const std::string& bundleIdentifier) = 0;
 
   /// Ends every instance without waiting for it; for the end of the daemon.

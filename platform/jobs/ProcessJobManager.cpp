@@ -322,8 +322,7 @@ std::vector<JobManager::Instance> ProcessJobManager::instances(const std::string
     queue_.assertOnQueue();
     std::vector<Instance> found;
     for (const auto& [id, instance] : running_) {
-      const bool wanted = bundleIdentifier.empty() || instance.bundleIdentifier == bundleIdentifier;
-      if (!wanted || instance.process == nullptr) continue;
+      if (instance.bundleIdentifier != bundleIdentifier || instance.process == nullptr) continue;
       found.push_back({instance.bundleIdentifier, instance.version, instance.process->pid(), instance.busyCount != 0});
     }
     return found;

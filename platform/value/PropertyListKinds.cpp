@@ -3,6 +3,8 @@
 #include <cmath>
 #include <limits>
 
+#include "platform/value/DateText.h"
+
 namespace platform {
 namespace {
 
@@ -40,7 +42,8 @@ Value toPropertyListKinds(const Value& value) {
       if (value.exactUnsigned() > std::uint64_t{std::numeric_limits<std::int64_t>::max()}) return value;
       return static_cast<std::int64_t>(value.exactUnsigned());
     case Kind::Date:
-      return Date{value.date().seconds, 0};
+      // A year that a property list cannot write would keep everything beside it from being saved.
+      return dateText(value.date()) ? Value(Date{value.date().seconds, 0}) : Value();
     case Kind::Real:
       return std::isfinite(value.realValue()) ? value : Value();
     case Kind::Message:

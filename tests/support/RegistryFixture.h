@@ -121,10 +121,13 @@ class RegistryFixture : public ::testing::Test {
     using Clock = std::chrono::steady_clock;
     platform::MainRunLoop& loop = platform::MainRunLoop::main();
     const auto deadline = Clock::now() + std::chrono::seconds(20);
+    bool over = false;  // one stop a wait: a second one would end the next wait's run
     const auto timer = loop.addTimer(2, [&] {
-      if (condition() || Clock::now() > deadline) loop.stop();
+      if (over || !(condition() || Clock::now() > deadline)) return;
+      over = true;
+      loop.stop();
     });
-    loop.run();
+    while (!over) loop.run();
     return condition();
   }
 

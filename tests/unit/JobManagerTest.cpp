@@ -186,7 +186,7 @@ TEST_F(JobManagerTest, RemovalWaitsForWhatIsJustBeingStartedAndKeepsItFromRunnin
   EXPECT_FALSE(begin(host)) << "the removal is behind us on the queue";
   EXPECT_EQ(answerCount_, 0);
   EXPECT_EQ(jobs_->instanceStarted(launch->instance, instance.pidfd()), EPERM);
-  EXPECT_TRUE(jobs_->instances("").empty());
+  EXPECT_TRUE(jobs_->instances(kIdentifier).empty());
   jobs_->launchFailed(launch->instance);
   ASSERT_TRUE(answered(1));
   EXPECT_EQ(answer_, 0);

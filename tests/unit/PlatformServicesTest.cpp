@@ -47,10 +47,13 @@ mode_t modeOf(const std::string& path) {
 // Runs the main loop until the condition holds or 20 seconds have passed; answers the condition.
 bool runUntil(const std::function<bool()>& condition) {
   const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
+  bool over = false;  // one stop a wait: a second one would end the next wait's run
   const auto timer = MainRunLoop::main().addTimer(2, [&] {
-    if (condition() || std::chrono::steady_clock::now() > deadline) MainRunLoop::main().stop();
+    if (over || !(condition() || std::chrono::steady_clock::now() > deadline)) return;
+    over = true;
+    MainRunLoop::main().stop();
   });
-  MainRunLoop::main().run();
+  while (!over) MainRunLoop::main().run();
   return condition();
 }
 
