@@ -1,7 +1,7 @@
 #include "platform/hostservices/Bubblewrap.h"
 
 #include <fcntl.h>
-#include <grp.h>
+#include <linux/keyctl.h>
 #include <signal.h>
 #include <sys/prctl.h>
 #include <sys/stat.h>
@@ -49,6 +49,8 @@ bool become(const UserAndGroup& user) {
   (void)::sigprocmask(SIG_SETMASK, &none, nullptr);
   (void)::umask(kUmask);
   if (start.user && !become(*start.user)) ::_exit(launch::kCannotExecute);
+  // Keys that somebody gave to the daemon are not the plug-in's; a kernel without keys knows none either.
+  (void)::syscall(SYS_keyctl, KEYCTL_JOIN_SESSION_KEYRING, nullptr);
   // Changing the user clears this. bubblewrap asks for it again, but a parent may end before it does.
   if (::prctl(PR_SET_PDEATHSIG, SIGKILL) != 0 || ::getppid() != parent) ::_exit(launch::kCannotExecute);
   for (std::size_t number = 0; number < descriptors.size(); ++number) {
@@ -56,17 +58,9 @@ bool become(const UserAndGroup& user) {
   }
   if (::syscall(SYS_close_range, launch::kFirstFreeDescriptor, ~0U, 0) != 0) ::_exit(launch::kCannotExecute);
 
-  char name[] = "bwrap";
-  char option[] = "--args";
-  char options[] = {static_cast<char>('0' + launch::kOptionsDescriptor), '\0'};
-  char end[] = "--";
-  char program[] = {'/', 'p', 'r', 'o', 'c',
-                    '/', 's', 'e', 'l', 'f',
-                    '/', 'f', 'd', '/', static_cast<char>('0' + launch::kProgramDescriptor),
-                    '\0'};
-  char* arguments[] = {name, option, options, end, program, nullptr};
-  char* environment[] = {nullptr};
-  ::execve(start.program, arguments, environment);
+  const char* const arguments[] = {"bwrap", "--args", launch::kOptionsNumber, "--", launch::kProgramPath, nullptr};
+  const char* const environment[] = {nullptr};
+  ::execve(start.program, const_cast<char* const*>(arguments), const_cast<char* const*>(environment));
   ::_exit(launch::kCannotExecute);
 }
 

@@ -55,7 +55,7 @@ union DescriptorMessage {
 
 [[noreturn]] void cloneInChild(const char* path, int channel) {
   (void)::prctl(PR_SET_PDEATHSIG, SIGKILL);
-  const int tree = ::unshare(CLONE_NEWUSER | CLONE_NEWNS) == 0 ? cloneMount(path) : -1;
+  const int tree = cloneMount(path);
   int number = tree < 0 ? errno : 0;
   struct iovec part = {&number, sizeof number};
   DescriptorMessage control = {};
@@ -107,7 +107,8 @@ UniqueFd cloneThroughChild(const char* path, int* errorNumber) {
   }
   const UniqueFd own(channel[0]);
   UniqueFd childs(channel[1]);
-  const pid_t child = ::fork();
+  const pid_t child = static_cast<pid_t>(
+      ::syscall(SYS_clone, CLONE_NEWUSER | CLONE_NEWNS | SIGCHLD, nullptr, nullptr, nullptr, nullptr));
   if (child == 0) cloneInChild(path, childs.get());
   if (child < 0) {
     *errorNumber = errno;

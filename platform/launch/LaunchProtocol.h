@@ -21,8 +21,10 @@ inline constexpr int kControlDescriptor = 4;
 inline constexpr int kPlanDescriptor = 5;
 /// bubblewrap's options.
 inline constexpr int kOptionsDescriptor = 6;
+inline constexpr const char* kOptionsNumber = "6";
 /// The opened xtd-launch, so that it need not lie anywhere in the sandbox.
 inline constexpr int kProgramDescriptor = 7;
+inline constexpr const char* kProgramPath = "/proc/self/fd/7";
 inline constexpr int kFirstFreeDescriptor = 8;
 
 inline constexpr char kRunning = 'r';
