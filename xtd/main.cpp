@@ -1,4 +1,5 @@
 // xtd: the plug-in broker. Parses its options, builds the one server and runs it until SIGTERM.
+#include <malloc.h>
 #include <systemd/sd-daemon.h>
 #include <unistd.h>
 
@@ -20,6 +21,10 @@ using platform::MainRunLoop;
 // Exit statuses; after SIGTERM it is 0.
 constexpr int kCannotServe = 1;
 constexpr int kUsage = 2;
+
+// Bytes: what the heap keeps of what is freed, and takes from the system at a time.
+constexpr int kKeptHeap = 32 << 20;
+constexpr int kHeapStep = 1 << 20;
 
 struct Options {
   std::uint32_t cacheLimit = 1000000;
@@ -86,8 +91,17 @@ std::shared_ptr<extora::XTDServer> makeServer(const Options& options) {
 
 }  // namespace
 
+// A large reply is built of some megabytes in small pieces. Kept by the heap they cost half as much the next time,
+// since the first touch of fresh memory is dear; the IPC layer gives them back when the daemon has been idle.
+void keepHeap() {
+  ::mallopt(M_TRIM_THRESHOLD, kKeptHeap);
+  ::mallopt(M_MMAP_THRESHOLD, kKeptHeap);
+  ::mallopt(M_TOP_PAD, kHeapStep);
+}
+
 int main(int argc, char* argv[]) {
   MainRunLoop::blockSignals();
+  keepHeap();
   std::set_terminate(logAndAbort);
   extora::XTLogOps().info("xtd is launching");
   const Options options = parse(argc, argv);

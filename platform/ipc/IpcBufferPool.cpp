@@ -1,5 +1,7 @@
 #include "platform/ipc/IpcBufferPool.h"
 
+#include <malloc.h>
+
 #include <utility>
 
 #include "platform/ipc/IpcEventPool.h"
@@ -49,17 +51,20 @@ void IpcBufferPool::watch() {
 }
 
 void IpcBufferPool::trim() {
-  std::vector<Bytes> unused;
+  bool watched = false;
   {
     MutexLock lock(mutex_);
-    watched_ = std::exchange(used_, false);
-    if (!watched_) {
-      unused.swap(free_);
+    watched = watched_ = std::exchange(used_, false);
+    if (!watched) {
+      free_.clear();
       kept_ = 0;
-      return;
     }
   }
-  watch();
+  if (watched) {
+    watch();
+  } else {
+    ::malloc_trim(0);  // with the small pieces around them, which the heap keeps while it is in use
+  }
 }
 
 }  // namespace platform
