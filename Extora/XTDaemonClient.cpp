@@ -9,6 +9,7 @@
 #include "platform/files/Directories.h"
 #include "platform/ipc/IpcCodec.h"
 #include "platform/value/InternalInconsistency.h"
+#include "platform/value/PropertyListKinds.h"
 
 namespace extora {
 namespace {
@@ -38,38 +39,10 @@ std::shared_ptr<IpcConnection> connectService(const std::string& service, std::s
           }};
 }
 
-// The value as the wire carries it: descriptors and messages, at any depth, are left out. A value without them comes
-// back as it is, node and all.
+// The value as the wire carries it: descriptors and messages, at any depth, are left out.
 Value toWireValue(const Value& value) {
-  switch (value.kind()) {
-    case platform::Kind::Message:
-    case platform::Kind::Descriptor:
-      return {};
-    case platform::Kind::Array: {
-      Array result(value);
-      std::size_t at = 0;
-      for (const Value& item : value.items()) {
-        Value converted = toWireValue(item);
-        if (converted.isNothing()) {
-          result.removeAt(at);
-          continue;
-        }
-        if (!converted.identicalTo(item)) result.set(at, std::move(converted));
-        ++at;
-      }
-      return result;
-    }
-    case platform::Kind::Dictionary: {
-      Dictionary result(value);
-      for (const auto& [key, item] : value.entries()) {
-        Value converted = toWireValue(item);
-        if (!converted.identicalTo(item)) result.set(key, std::move(converted));
-      }
-      return result;
-    }
-    default:
-      return value;
-  }
+  return platform::convertLeaves(
+      value, [](const Value& leaf) { return leaf.isMessage() || leaf.isDescriptor() ? Value() : leaf; });
 }
 
 Value pathArray(const std::vector<std::string>& paths) {

@@ -8,33 +8,7 @@
 namespace platform {
 namespace {
 
-Value convertArray(const Value& value) {
-  Array result(value);
-  std::size_t at = 0;
-  for (const Value& item : value.items()) {
-    Value converted = toPropertyListKinds(item);
-    if (converted.isNothing()) {
-      result.removeAt(at);
-      continue;
-    }
-    if (!converted.identicalTo(item)) result.set(at, std::move(converted));
-    ++at;
-  }
-  return result;
-}
-
-Value convertDictionary(const Value& value) {
-  Dictionary result(value);
-  for (const auto& [key, item] : value.entries()) {
-    Value converted = toPropertyListKinds(item);
-    if (!converted.identicalTo(item)) result.set(key, std::move(converted));
-  }
-  return result;
-}
-
-}  // namespace
-
-Value toPropertyListKinds(const Value& value) {
+Value convertLeaf(const Value& value) {
   switch (value.kind()) {
     case Kind::Uuid:
       return value.uuid().text();
@@ -49,13 +23,41 @@ Value toPropertyListKinds(const Value& value) {
     case Kind::Message:
     case Kind::Descriptor:
       return {};
-    case Kind::Array:
-      return convertArray(value);
-    case Kind::Dictionary:
-      return convertDictionary(value);
     default:
       return value;
   }
+}
+
+}  // namespace
+
+Value convertLeaves(const Value& value, const std::function<Value(const Value& leaf)>& convert) {
+  if (value.isArray()) {
+    Array result(value);
+    std::size_t at = 0;
+    for (const Value& item : value.items()) {
+      Value converted = convertLeaves(item, convert);
+      if (converted.isNothing()) {
+        result.removeAt(at);
+        continue;
+      }
+      if (!converted.identicalTo(item)) result.set(at, std::move(converted));
+      ++at;
+    }
+    return result;
+  }
+  if (value.isDictionary()) {
+    Dictionary result(value);
+    for (const auto& [key, item] : value.entries()) {
+      Value converted = convertLeaves(item, convert);
+      if (!converted.identicalTo(item)) result.set(key, std::move(converted));
+    }
+    return result;
+  }
+  return convert(value);
+}
+
+Value toPropertyListKinds(const Value& value) {
+  return convertLeaves(value, convertLeaf);
 }
 
 }  // namespace platform
