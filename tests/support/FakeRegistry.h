@@ -1,7 +1,8 @@
-// FakeRegistry: an application registry of records that a test hands it; counts what it is asked. For one thread at a
+// FakeRegistry: an application registry of records that a test hands it; counts what it is asked. Changed by one thread at a
 // time. sampleRecord gives a plug-in that passes the self-check, to be changed before it is installed.
 #pragma once
 
+#include <atomic>
 #include <map>
 #include <memory>
 #include <set>
@@ -56,8 +57,8 @@ class FakeRegistry : public platform::ApplicationRegistry {
   std::map<std::string, platform::Dictionary> localized;
   /// (type, what it conforms to).
   std::set<std::pair<std::string, std::string>> conformances;
-  int lookups = 0;  ///< of single plug-ins, by UUID or URL
-  int clears = 0;   ///< of the schema caches
+  std::atomic<int> lookups = 0;  ///< of single plug-ins, by UUID or URL
+  int clears = 0;                ///< of the schema caches
   platform::Value lastQuery;
 
  private:

@@ -27,7 +27,7 @@ class XTDPlugInTest : public ::testing::Test {
     return XTDPlugIn::initWithARData(platform::plugInRecord(registry_->install(std::nullopt, {record}), 0), registry_,
                                      {});
   }
-  int lookups() { return std::exchange(registry_->lookups, 0); }
+  int lookups() { return registry_->lookups.exchange(0); }
 
   std::shared_ptr<tests::FakeRegistry> registry_ = std::make_shared<tests::FakeRegistry>();
 };
