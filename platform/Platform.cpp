@@ -72,11 +72,11 @@ std::shared_ptr<Platform> Platform::make(const Directories& directories, Error* 
   platform->locale = Locale::make(directories);
   platform->notifications = Notifications::make(directories);
   platform->notifications->prepare(kAnnotationChangeNotification);
-  platform->notifications->prepare(kRegistryChangeNotification);
   platform->preferences = Preferences::make(directories);
   platform->signing = CodeSigning::make();
   platform->sandbox = Sandbox::make();
-  platform->registry = makeBundleRegistry({directories, platform->files, platform->containers, platform->locale});
+  platform->registry = makeBundleRegistry(
+      {directories, platform->files, platform->containers, platform->locale, platform->notifications});
   platform->jobs = ProcessJobManager::make(platform->registry, ProcessJobManager::graceFromEnvironment());
   platform->assertions = ProcessAssertions::make(platform->jobs);
   platform->consent = ConsentService::make(directories);

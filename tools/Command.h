@@ -27,6 +27,10 @@ class Command {
   [[nodiscard]] virtual ExitStatus run(DaemonSession& daemon, std::string& out) = 0;
 };
 
+/// The hint for a refusal of what only managers may do.
+inline constexpr const char* kManagersOnly =
+    "this is for managers: run xtctl-manager, which has the entitlement, outside of any sandbox";
+
 /// Writes "xtctl: text" as one line to standard error, with control characters escaped.
 void complain(const std::string& text);
 

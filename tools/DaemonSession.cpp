@@ -13,14 +13,17 @@ using extora::XTDaemonClient;
 using platform::IpcReplyObject;
 using platform::Value;
 
-ExitStatus DaemonSession::ask(const Send& send, Value& reply, const std::string& hint) {
+IpcReplyObject DaemonSession::request(const Send& send) {
   if (!client_) client_ = XTDaemonClient::initWithServiceName(service_);
   // Shared with the reply function, which may still be returning when the answer has been taken.
   auto promise = std::make_shared<std::promise<IpcReplyObject>>();
   auto answer = promise->get_future();
   send(*client_, [promise](const IpcReplyObject& object) { promise->set_value(object); });
-  const IpcReplyObject object = answer.get();
+  return answer.get();
+}
 
+ExitStatus DaemonSession::ask(const Send& send, Value& reply, const std::string& hint) {
+  const IpcReplyObject object = request(send);
   if (object.error) {
     // A failed connection names the socket that was tried; one that broke later does not.
     const std::string socket = platform::Directories::forClient(service_).runtime + "/services/" + service_;

@@ -4,6 +4,7 @@
 #include <nettle/base64.h>
 
 #include <cmath>
+#include <optional>
 #include <string_view>
 
 #include "platform/ipc/IpcCodec.h"
@@ -48,8 +49,10 @@ std::string base64(const platform::Bytes& bytes) {
   return out;
 }
 
-void append(std::string& out, const Value& value, std::size_t indent) {
-  const std::string lineFeed = "\n" + std::string(indent + 2, ' ');
+// Lines are broken unless `indent` is nothing.
+void append(std::string& out, const Value& value, std::optional<std::size_t> indent) {
+  const auto lineBreak = [](std::optional<std::size_t> at) { return at ? "\n" + std::string(*at, ' ') : ""; };
+  const auto inner = indent ? std::optional(*indent + 2) : std::nullopt;
   switch (value.kind()) {
     case Kind::Nothing:
       out += "null";
@@ -88,11 +91,11 @@ void append(std::string& out, const Value& value, std::size_t indent) {
       out += '[';
       const char* separator = "";
       for (const Value& item : value.items()) {
-        out += separator + lineFeed;
-        append(out, item, indent + 2);
-        separator = ",";
+        out += separator + lineBreak(inner);
+        append(out, item, inner);
+        separator = indent ? "," : ", ";
       }
-      if (value.size() > 0) out += "\n" + std::string(indent, ' ');
+      if (value.size() > 0) out += lineBreak(indent);
       out += ']';
       break;
     }
@@ -100,13 +103,13 @@ void append(std::string& out, const Value& value, std::size_t indent) {
       out += '{';
       const char* separator = "";
       for (const auto& [key, item] : value.entries()) {
-        out += separator + lineFeed;
+        out += separator + lineBreak(inner);
         appendString(out, platform::repairedXmlText(key));
         out += ": ";
-        append(out, item, indent + 2);
-        separator = ",";
+        append(out, item, inner);
+        separator = indent ? "," : ", ";
       }
-      if (value.size() > 0) out += "\n" + std::string(indent, ' ');
+      if (value.size() > 0) out += lineBreak(indent);
       out += '}';
       break;
     }
@@ -118,6 +121,13 @@ void append(std::string& out, const Value& value, std::size_t indent) {
 std::string jsonText(const Value& value) {
   std::string out;
   append(out, value, 0);
+  out += '\n';
+  return out;
+}
+
+std::string jsonLine(const Value& value) {
+  std::string out;
+  append(out, value, std::nullopt);
   out += '\n';
   return out;
 }

@@ -11,5 +11,7 @@ namespace tools {
 /// that is not finite is null; a UUID is its text, data is base64, a date is ISO 8601 in UTC, a wire message the value
 /// that it carries. Control characters are escaped, so that the text is safe on a terminal; other text stands as UTF-8.
 std::string jsonText(const platform::Value& value);
+/// The same on one line.
+std::string jsonLine(const platform::Value& value);
 
 }  // namespace tools

@@ -40,11 +40,7 @@ Examples
 
 CLI::App* MatchCommand::addTo(CLI::App& app) {
   CLI::App* command = app.add_subcommand("match", "List the plug-ins that this program, as a host, is offered");
-  command->add_option("-r,--rule", rules_, "Only plug-ins for which the rule holds (below)")
-      ->option_text("KEY=PATTERN")
-      ->check([](const std::string& rule) { return ruleFault(rule); })
-      ->allow_extra_args(false);
-  command->add_option("--rules", rulesFile_, "Rules from an XML property list, a dictionary")->option_text("FILE");
+  addRuleOptions(*command, rules_, rulesFile_);
   command->add_flag("--all-versions", allVersions_, "Every version of a plug-in, not only the newest");
   command->add_flag("--duplicates", duplicates_, "With --all-versions: plug-ins of equal version too");
   command->add_flag("--system-only", systemOnly_, "Only plug-ins on the system volume");
@@ -56,8 +52,7 @@ CLI::App* MatchCommand::addTo(CLI::App& app) {
 
 ExitStatus MatchCommand::run(DaemonSession& daemon, std::string& out) {
   std::string fault;
-  std::optional<Dictionary> rules = rulesFile_.empty() ? Dictionary() : rulesFromFile(rulesFile_, fault);
-  if (rules) rules = rulesFromArguments(rules_, *rules, fault);
+  const std::optional<Dictionary> rules = rulesOf(rules_, rulesFile_, fault);
   if (rules && duplicates_ && !allVersions_) fault = "--duplicates needs --all-versions";
   if (!fault.empty()) {
     complain(fault);
@@ -70,9 +65,9 @@ ExitStatus MatchCommand::run(DaemonSession& daemon, std::string& out) {
   if (systemOnly_) flags |= extora::XTDiscoverSystemOnly;
   if (all_) flags |= extora::XTDiscoverAll;
   Value reply;
-  const ExitStatus status = daemon.ask(
-      [&](auto& client, const auto& answer) { client.matchPlugIns(*rules, flags, answer); }, reply,
-      all_ ? "--all is for managers: run xtctl-manager, which has the entitlement, outside of any sandbox" : "");
+  const ExitStatus status =
+      daemon.ask([&](auto& client, const auto& answer) { client.matchPlugIns(*rules, flags, answer); }, reply,
+                 all_ ? kManagersOnly : "");
   if (status != ExitStatus::Success) return status;
 
   const auto forms = sortedForms(daemon.matches(reply));

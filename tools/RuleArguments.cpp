@@ -24,10 +24,10 @@ Value patternOf(std::string text) {
 
 }  // namespace
 
-std::string ruleFault(const std::string& argument) {
+std::string ruleFault(const std::string& argument, const char* what) {
   const std::size_t equals = argument.find('=');
-  if (equals == std::string::npos) return fmt::format("\"{}\" has no \"=\": a rule is KEY=PATTERN", argument);
-  if (equals == 0) return fmt::format("\"{}\" has no key: a rule is KEY=PATTERN", argument);
+  if (equals == std::string::npos) return fmt::format("\"{}\" has no \"=\": {}", argument, what);
+  if (equals == 0) return fmt::format("\"{}\" has no key: {}", argument, what);
   if (!platform::isXmlText(argument)) return fmt::format("\"{}\" is not plain UTF-8 text", argument);
   return {};
 }
@@ -57,7 +57,7 @@ std::optional<Dictionary> rulesFromArguments(const std::vector<std::string>& arg
   return rules;
 }
 
-std::optional<Dictionary> rulesFromFile(const std::string& path, std::string& fault) {
+std::optional<Dictionary> dictionaryFromFile(const std::string& path, std::string& fault) {
   platform::Error error;
   const auto bytes = platform::Files::make()->readFileData(path, &error);
   if (!bytes) {
@@ -70,10 +70,24 @@ std::optional<Dictionary> rulesFromFile(const std::string& path, std::string& fa
     return std::nullopt;
   }
   if (!rules.isDictionary()) {
-    fault = fmt::format("{}: rules are a dictionary", path);
+    fault = fmt::format("{}: not a dictionary", path);
     return std::nullopt;
   }
   return Dictionary(rules);
+}
+
+void addRuleOptions(CLI::App& command, std::vector<std::string>& arguments, std::string& file) {
+  command.add_option("-r,--rule", arguments, "Only plug-ins for which the rule holds")
+      ->option_text("KEY=PATTERN")
+      ->check([](const std::string& rule) { return ruleFault(rule); })
+      ->allow_extra_args(false);
+  command.add_option("--rules", file, "Rules from an XML property list, a dictionary")->option_text("FILE");
+}
+
+std::optional<Dictionary> rulesOf(const std::vector<std::string>& arguments, const std::string& file,
+                                  std::string& fault) {
+  const auto base = file.empty() ? Dictionary() : dictionaryFromFile(file, fault);
+  return base ? rulesFromArguments(arguments, *base, fault) : std::nullopt;
 }
 
 }  // namespace tools

@@ -6,12 +6,17 @@
 #include <vector>
 
 #include "platform/log/Log.h"
+#include "tools/AnnotateCommand.h"
+#include "tools/ElectCommand.h"
+#include "tools/ElectionsCommand.h"
+#include "tools/ExclusionsCommand.h"
 #include "tools/FindCommand.h"
 #include "tools/MatchCommand.h"
+#include "tools/WatchCommand.h"
 
 namespace {
 
-constexpr const char* kAbout = R"(Looks at the plug-ins that a running xtd knows and offers.)";
+constexpr const char* kAbout = R"(Looks at, and decides about, the plug-ins that a running xtd knows and offers.)";
 
 constexpr const char* kFooter = R"(`xtctl COMMAND --help` says more about a command.
 
@@ -37,6 +42,11 @@ int run(int argc, char** argv) {
   std::vector<std::unique_ptr<tools::Command>> commands;
   commands.push_back(std::make_unique<tools::MatchCommand>());
   commands.push_back(std::make_unique<tools::FindCommand>());
+  commands.push_back(std::make_unique<tools::WatchCommand>());
+  commands.push_back(std::make_unique<tools::ElectCommand>());
+  commands.push_back(std::make_unique<tools::ElectionsCommand>());
+  commands.push_back(std::make_unique<tools::AnnotateCommand>());
+  commands.push_back(std::make_unique<tools::ExclusionsCommand>());
   std::vector<CLI::App*> parsers;
   for (const auto& command : commands) parsers.push_back(command->addTo(app));
   for (CLI::App* parser : parsers) parser->fallthrough();  // --service may stand behind the command too

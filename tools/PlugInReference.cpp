@@ -1,0 +1,69 @@
+#include "tools/PlugInReference.h"
+
+#include <fmt/format.h>
+
+#include <filesystem>
+
+#include "Extora/XTVocabulary.h"
+#include "platform/files/Files.h"
+#include "tools/Command.h"
+
+namespace tools {
+
+using platform::Dictionary;
+using platform::Url;
+using platform::Uuid;
+using platform::Value;
+
+PlugInReference PlugInReference::parse(const std::string& text) {
+  PlugInReference reference;
+  reference.text = text;
+  reference.uuid = Uuid::parse(text);
+  if (reference.uuid || text.empty()) return reference;
+  if (text.find("://") != std::string::npos || text.rfind("file:", 0) == 0) {
+    reference.url = Url::parse(text);
+    return reference;
+  }
+  std::error_code error;
+  if (text.find('/') == std::string::npos && !std::filesystem::exists(text, error)) return reference;
+  const auto absolute = std::filesystem::absolute(text, error).lexically_normal().string();
+  if (!error) reference.url = Url::file(platform::Files::make()->resolvePath(absolute).value_or(absolute));
+  return reference;
+}
+
+ExitStatus PlugInReference::find(DaemonSession& daemon, Value& form) const {
+  Value reply;
+  ExitStatus status = ExitStatus::Success;
+  if (isIdentifier()) {
+    const Dictionary rules{{extora::XTIdentifierAttribute, "=" + text}};
+    status = daemon.ask([&](auto& client, const auto& answer) { client.matchPlugIns(rules, 0, answer); }, reply);
+    if (status != ExitStatus::Success) return status;
+    const Value forms = daemon.matches(reply);
+    for (const Value& each : forms.items()) {
+      if (each[extora::XTIdentifierFormKey].string() != text) continue;
+      form = each;
+      return status;
+    }
+    complain(fmt::format("no plug-in with the identifier {} is offered here; name it by UUID or path", text));
+    return ExitStatus::Refused;
+  }
+  status = daemon.ask(
+      [&](auto& client, const auto& answer) {
+        uuid ? client.findPlugInByUUID(*uuid, answer) : client.findPlugInByPathURL(*url, answer);
+      },
+      reply);
+  if (status != ExitStatus::Success) return status;
+  form = daemon.matches(reply);
+  if (form.isDictionary()) return ExitStatus::Success;
+  complain("the daemon knows this plug-in but could not describe it; its log says why");
+  return ExitStatus::Refused;
+}
+
+std::string plugInReferenceFault(const std::string& text) {
+  if (text.empty()) return "an empty text names no plug-in";
+  const auto reference = PlugInReference::parse(text);
+  const bool url = text.find("://") != std::string::npos || text.rfind("file:", 0) == 0;
+  return reference.isIdentifier() && url ? "\"" + text + "\" is no file URL" : "";
+}
+
+}  // namespace tools
