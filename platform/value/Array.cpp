@@ -31,10 +31,4 @@ void Array::set(std::size_t index, Value value) {
   writable()[index] = std::move(value);
 }
 
-void Array::removeAt(std::size_t index) {
-  if (index >= size()) throw InternalInconsistency("an element beyond the end of an array was removed");
-  std::vector<Value>& all = writable();
-  all.erase(all.begin() + static_cast<std::ptrdiff_t>(index));
-}
-
 }  // namespace platform

@@ -25,9 +25,8 @@ class Array {
 
   void reserve(std::size_t capacity);
   void append(Value value);
-  /// `index` lies inside the array for both; otherwise a broken contract.
+  /// `index` lies inside the array; otherwise a broken contract.
   void set(std::size_t index, Value value);
-  void removeAt(std::size_t index);
 
   friend bool operator==(const Array& a, const Array& b) noexcept {
     return a.size() == b.size() && (a.empty() || a.value_ == b.value_);

@@ -2,6 +2,10 @@
 
 #include <cmath>
 #include <limits>
+#include <optional>
+#include <span>
+#include <utility>
+#include <vector>
 
 #include "platform/value/DateText.h"
 
@@ -28,30 +32,47 @@ Value convertLeaf(const Value& value) {
   }
 }
 
+const Value& valueOf(const Value& item) {
+  return item;
+}
+const Value& valueOf(const Value::Entry& entry) {
+  return entry.value;
+}
+Value withValue(const Value&, Value value) {
+  return value;
+}
+Value::Entry withValue(const Value::Entry& entry, Value value) {
+  return {entry.key, std::move(value)};
+}
+
+// What becomes of the elements; nothing while each stays as it is. They are collected, never removed one by one: what a
+// sender chose must not take a time that grows with its square.
+template <typename Element>
+std::optional<std::vector<Element>> convertEach(std::span<const Element> elements,
+                                                const std::function<Value(const Value& leaf)>& convert) {
+  std::optional<std::vector<Element>> changed;
+  for (std::size_t i = 0; i < elements.size(); ++i) {
+    Value converted = convertLeaves(valueOf(elements[i]), convert);
+    if (!changed) {
+      if (converted && converted.identicalTo(valueOf(elements[i]))) continue;
+      changed.emplace(elements.begin(), elements.begin() + static_cast<std::ptrdiff_t>(i));
+      changed->reserve(elements.size());
+    }
+    if (!converted.isNothing()) changed->push_back(withValue(elements[i], std::move(converted)));
+  }
+  return changed;
+}
+
 }  // namespace
 
 Value convertLeaves(const Value& value, const std::function<Value(const Value& leaf)>& convert) {
   if (value.isArray()) {
-    Array result(value);
-    std::size_t at = 0;
-    for (const Value& item : value.items()) {
-      Value converted = convertLeaves(item, convert);
-      if (converted.isNothing()) {
-        result.removeAt(at);
-        continue;
-      }
-      if (!converted.identicalTo(item)) result.set(at, std::move(converted));
-      ++at;
-    }
-    return result;
+    auto changed = convertEach(value.items(), convert);
+    return changed ? Value(Array(std::move(*changed))) : value;
   }
   if (value.isDictionary()) {
-    Dictionary result(value);
-    for (const auto& [key, item] : value.entries()) {
-      Value converted = convertLeaves(item, convert);
-      if (!converted.identicalTo(item)) result.set(key, std::move(converted));
-    }
-    return result;
+    auto changed = convertEach(value.entries(), convert);
+    return changed ? Value(Dictionary(std::move(*changed))) : value;
   }
   return convert(value);
 }

@@ -121,17 +121,15 @@ TEST(ValueTest, AWriteNeverReachesWhoeverSharesTheNode) {
   Array list(copy["list"]);
   list.append(3);
   list.set(0, "first");
-  list.removeAt(1);
   copy.set("list", list);
   EXPECT_EQ(before, Value(Dictionary{{"inner", Dictionary{{"x", 1}}}, {"list", Array{1, 2}}}));
-  EXPECT_EQ(copy["list"], Value(Array{"first", 3}));
+  EXPECT_EQ(copy["list"], Value(Array{"first", 2, 3}));
   EXPECT_TRUE(before["inner"].identicalTo(copy["inner"]));
   EXPECT_FALSE(before.identicalTo(Value(copy)));
   // Elements of a container may be put back into it while it is written.
   for (int i = 0; i < 100; ++i) list.append(list[0]);
-  EXPECT_EQ(list[101], Value("first"));
-  EXPECT_THROW(list.set(102, 0), InternalInconsistency);
-  EXPECT_THROW(list.removeAt(102), InternalInconsistency);
+  EXPECT_EQ(list[102], Value("first"));
+  EXPECT_THROW(list.set(103, 0), InternalInconsistency);
 }
 
 TEST(ValueTest, ThreadsMayCopyAndDropTheSameValue) {
