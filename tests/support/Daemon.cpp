@@ -8,9 +8,12 @@
 #include <sys/un.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <array>
 #include <cstring>
 #include <fstream>
 #include <iostream>
+#include <utility>
 
 #include "platform/ipc/IpcCodec.h"
 
@@ -28,10 +31,26 @@ const sockaddr* generic(const sockaddr_un& address) {
   return reinterpret_cast<const sockaddr*>(&address);
 }
 
+std::pair<platform::UniqueFd, platform::UniqueFd> socketPair() {
+  std::array<int, 2> ends{};
+  if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends.data()) != 0) std::abort();
+  return {platform::UniqueFd(ends[0]), platform::UniqueFd(ends[1])};
+}
+
 }  // namespace
+
+std::string failureOf(const Value& reply) {
+  if (!reply["errorcode"]) return {};
+  return std::to_string(reply["errorcode"].exactUnsigned()) + " " + reply["error"].string();
+}
 
 Client::Client(const std::string& runtime, const std::string& service)
     : connection_(platform::ipcConnectService(runtime, service, queue_)) {
+  connection_->setEventHandler([](const platform::IpcEvent&) {});
+  connection_->resume();
+}
+
+Client::Client(platform::UniqueFd socket) : connection_(platform::ipcConnectionOverSocket(std::move(socket), queue_)) {
   connection_->setEventHandler([](const platform::IpcEvent&) {});
   connection_->resume();
 }
@@ -56,6 +75,15 @@ Array Client::match(const Dictionary& rules, std::uint64_t flags) {
   const Value reply = request("match", {{"rules", rules}, {"flags", flags}});
   EXPECT_TRUE(reply["error"].isNothing()) << reply.describe();
   return Array(platform::fromWireMessage(reply["matches"]));
+}
+
+std::vector<std::string> Client::offered(const Dictionary& rules, std::uint64_t flags) {
+  std::vector<std::string> texts;
+  for (const Value& form : match(rules, flags)) {
+    texts.push_back(form["identifier"].string() + " " + form["version"].string());
+  }
+  std::sort(texts.begin(), texts.end());
+  return texts;
 }
 
 Daemon::Daemon() {
@@ -143,13 +171,13 @@ std::string Daemon::hostProgram() {
   return TEST_HOST_BINARY;
 }
 
-std::string Daemon::askAsHost(const std::filesystem::path& executable, std::uint64_t flags,
-                              const std::string& identifier) const {
-  std::vector<std::string> arguments{executable, runtime(), kService, std::to_string(flags)};
-  if (!identifier.empty()) arguments.push_back(identifier);
-  RunningProgram host(arguments, {}, STDOUT_FILENO);
-  host.wait();
-  return host.output();
+std::string Daemon::writeHost(const std::string& name, const Value& entitlements,
+                              std::vector<SampleBundle> plugIns) const {
+  SampleBundle application = sampleApplication("com.example." + name, std::move(plugIns));
+  application.info.set("HBBundleExecutable", "host");
+  application.program = hostProgram();
+  application.entitlements = entitlements;
+  return writeBundle(applications(), application) + "/host";
 }
 
 std::uint64_t Daemon::notificationCount(const std::string& name) const {
@@ -160,5 +188,14 @@ std::uint64_t Daemon::notificationCount(const std::string& name) const {
   for (int i = 7; i >= 0; --i) count = count << 8 | bytes[i];
   return count;
 }
+
+Host::Host(const Daemon& daemon, const std::filesystem::path& executable, std::vector<std::string> before)
+    : Host(socketPair(), [&] {
+        before.insert(before.end(), {executable, daemon.runtime(), Daemon::kService});
+        return before;
+      }()) {}
+
+Host::Host(Pair sockets, const std::vector<std::string>& command)
+    : Client(std::move(sockets.first)), program_(command, {}, STDERR_FILENO, sockets.second.get()) {}
 
 }  // namespace tests

@@ -18,6 +18,7 @@
 #include "platform/queue/SerialQueue.h"
 #include "platform/value/Value.h"
 #include "tests/support/RunningProgram.h"
+#include "tests/support/SampleBundles.h"
 
 namespace tests {
 
@@ -25,10 +26,15 @@ using platform::Array;
 using platform::Dictionary;
 using platform::Value;
 
+/// "CODE TEXT" of a refused request's reply; "" when it was served.
+std::string failureOf(const Value& reply);
+
 /// One connection to the daemon.
 class Client {
  public:
   Client(const std::string& runtime, const std::string& service);
+  /// Over a connected socket.
+  explicit Client(platform::UniqueFd socket);
   ~Client();
   /// Sends `request` and waits for its reply dictionary; fails the test when the connection broke instead.
   Value send(const Dictionary& request);
@@ -36,6 +42,8 @@ class Client {
   Value request(std::string_view type, Dictionary entries = {});
   /// The forms of a "match"; fails the test when the daemon refused it.
   Array match(const Dictionary& rules, std::uint64_t flags = 0);
+  /// "identifier version" of each of them, sorted.
+  std::vector<std::string> offered(const Dictionary& rules = {}, std::uint64_t flags = 0);
   platform::IpcConnection& connection() { return *connection_; }
   platform::SerialQueue& queue() { return queue_; }
 
@@ -85,9 +93,9 @@ class Daemon {
   platform::UniqueFd connectRaw() const;
   /// The program of the tests' host (tests/system/TestHost.cpp), to be put into a bundle or beside entitlements.
   static std::string hostProgram();
-  /// Lets a copy of that host ask this daemon with "match"; what it printed.
-  std::string askAsHost(const std::filesystem::path& executable, std::uint64_t flags = 0,
-                        const std::string& identifier = "") const;
+  /// Writes an application "com.example.<name>" with that program in it; the program's path.
+  std::string writeHost(const std::string& name, const Value& entitlements = {},
+                        std::vector<SampleBundle> plugIns = {}) const;
   /// How often the system-wide notification has been posted.
   std::uint64_t notificationCount(const std::string& name) const;
 
@@ -95,6 +103,19 @@ class Daemon {
   std::filesystem::path root_;
   std::map<std::string, std::string> environment_;
   std::unique_ptr<RunningProgram> process_;
+};
+
+/// A host process that runs with the daemon's environment and sends what it is given as its own requests.
+class Host : public Client {
+ public:
+  /// Runs a copy of the tests' host. `before` is a program, with arguments, that sets the scene and executes it.
+  Host(const Daemon& daemon, const std::filesystem::path& executable, std::vector<std::string> before = {});
+  pid_t pid() const { return program_.pid(); }
+
+ private:
+  using Pair = std::pair<platform::UniqueFd, platform::UniqueFd>;
+  Host(Pair sockets, const std::vector<std::string>& command);
+  RunningProgram program_;
 };
 
 }  // namespace tests

@@ -42,7 +42,7 @@ std::size_t countOf(std::string_view text, std::string_view part) {
 }
 
 RunningProgram::RunningProgram(const std::vector<std::string>& arguments,
-                               const std::map<std::string, std::string>& environment, int outputFd) {
+                               const std::map<std::string, std::string>& environment, int outputFd, int inputFd) {
   int ends[2];
   if (::pipe2(ends, O_CLOEXEC) != 0) std::abort();
   pipe_.reset(ends[0]);
@@ -52,6 +52,7 @@ RunningProgram::RunningProgram(const std::vector<std::string>& arguments,
   posix_spawn_file_actions_t actions;
   posix_spawn_file_actions_init(&actions);
   posix_spawn_file_actions_adddup2(&actions, writeEnd.get(), outputFd);
+  posix_spawn_file_actions_adddup2(&actions, inputFd, STDIN_FILENO);
   const int error = ::posix_spawn(&pid_, arguments.front().c_str(), &actions, nullptr, pointers(argumentTexts).data(),
                                   pointers(environmentTexts).data());
   posix_spawn_file_actions_destroy(&actions);

@@ -3,6 +3,7 @@
 #pragma once
 
 #include <sys/types.h>
+#include <unistd.h>
 
 #include <chrono>
 #include <condition_variable>
@@ -26,9 +27,9 @@ inline constexpr int kDeadlineMs = 30'000;
 class RunningProgram {
  public:
   /// Starts `arguments` (the program first) with the environment of this process changed by `environment`. What it
-  /// writes to `outputFd` (STDOUT_FILENO or STDERR_FILENO) is collected.
+  /// writes to `outputFd` (STDOUT_FILENO or STDERR_FILENO) is collected; `inputFd` becomes its standard input.
   RunningProgram(const std::vector<std::string>& arguments, const std::map<std::string, std::string>& environment,
-                 int outputFd);
+                 int outputFd, int inputFd = STDIN_FILENO);
   /// Kills it when it still runs.
   ~RunningProgram();
 

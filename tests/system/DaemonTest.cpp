@@ -20,15 +20,12 @@ using platform::Dictionary;
 using platform::IpcFrameHeader;
 using platform::Value;
 using tests::Daemon;
+using tests::failureOf;
 
 const Dictionary kFind = {{"request", "find"}, {"version", std::uint64_t{3}}};
 
 // Served before anything that follows it on its connection is looked at, the end included.
 const Dictionary kSyncFind = {{"request", "find"}, {"version", std::uint64_t{3}}, {"sync", true}};
-
-std::string failureOf(const Value& reply) {
-  return std::to_string(reply["errorcode"].exactUnsigned()) + " " + reply["error"].string();
-}
 
 Bytes frame(IpcFrameHeader header, const Bytes& body) {
   header.bodyLength = static_cast<std::uint32_t>(body.size());

@@ -1,8 +1,6 @@
 // Discovery end to end: which of the installed plug-ins a host is offered, and in which form.
 #include <gtest/gtest.h>
 
-#include <algorithm>
-
 #include "Extora/XTProtocol.h"
 #include "Extora/XTVocabulary.h"
 #include "tests/support/Daemon.h"
@@ -30,23 +28,8 @@ class DiscoveryTest : public ::testing::Test {
   std::string write(const std::filesystem::path& folder, const std::string& name, std::vector<SampleBundle> plugIns) {
     return tests::writeBundle(folder, sampleApplication("com.example." + name, std::move(plugIns)));
   }
-  /// As write, with the tests' host as the application's program; the host's path.
-  std::string writeHost(const std::string& name, std::vector<SampleBundle> plugIns) {
-    auto application = sampleApplication("com.example." + name, std::move(plugIns));
-    application.info.set("HBBundleExecutable", "host");
-    application.program = tests::Daemon::hostProgram();
-    return tests::writeBundle(daemon_.applications(), application) + "/host";
-  }
-  /// "identifier version" of what this process is offered, sorted.
-  Texts match(std::uint64_t flags = 0, const Dictionary& rules = {}) {
-    auto client = daemon_.connect();
-    Texts texts;
-    for (const Value& form : client.match(rules, flags)) {
-      texts.push_back(form["identifier"].string() + " " + form["version"].string());
-    }
-    std::sort(texts.begin(), texts.end());
-    return texts;
-  }
+  /// What this process is offered.
+  Texts match(std::uint64_t flags = 0, const Dictionary& rules = {}) { return daemon_.connect().offered(rules, flags); }
   void setExclusions(const Value& exclusions) {
     tests::writePropertyList(daemon_.config() / "preferences" / "com.orvane.extora.userprefs.plist",
                              Dictionary{{XTExclusionsPreferenceKey, exclusions}});
@@ -121,13 +104,12 @@ TEST_F(DiscoveryTest, OverriderAndOverriddenNameEachOther) {
 TEST_F(DiscoveryTest, AHostInAnApplicationIsOfferedItsOwnPlugIns) {
   auto dedicated = samplePlugIn("com.example.dedicated");
   tests::setPlugInKey(dedicated, "Dedicated", true);
-  const auto host = writeHost("host", {dedicated, versioned("com.example.x", "1")});
+  const auto host = daemon_.writeHost("host", {}, {dedicated, versioned("com.example.x", "1")});
   write(daemon_.applications(), "other", {versioned("com.example.x", "2")});
   write(daemon_.systemApplications(), "system", {versioned("com.example.x", "1")});
   daemon_.start();
   const std::string own = std::filesystem::path(host).parent_path() / "PlugIns";
-  EXPECT_EQ(daemon_.askAsHost(host),
-            "com.example.dedicated 1.0 " + own + "/dedicated.appex\ncom.example.x 1 " + own + "/x.appex\n");
+  EXPECT_EQ(tests::Host(daemon_, host).offered(), Texts({"com.example.dedicated 1.0", "com.example.x 1"}));
   EXPECT_EQ(daemon_.countInLog(" in favor of bundle-relative '" + own + "/x.appex'\n"), 2U);
   EXPECT_EQ(match(), Texts{"com.example.x 2"}) << "a host elsewhere";
 }
@@ -147,12 +129,12 @@ TEST_F(DiscoveryTest, AManagerMayLookAtEverythingThatIsNotExcluded) {
   }
   tests::writePropertyList(manager.string() + ".entitlements", Dictionary{{XTManagerEntitlement, true}});
   daemon_.start();
-  EXPECT_EQ(daemon_.askAsHost(stranger, XTDiscoverAll), "error 11 unauthorized discovery flag (XTDiscoverAll)\n");
-  EXPECT_EQ(daemon_.askAsHost(manager), "");
-  const auto lines = daemon_.askAsHost(manager, XTDiscoverAll);
-  EXPECT_EQ(tests::countOf(lines, "\n"), 2U) << lines;
-  EXPECT_EQ(tests::countOf(lines, "com.example.dedicated 1.0 "), 1U);
-  EXPECT_EQ(tests::countOf(lines, "com.example.secret 1.0 "), 1U);
+  EXPECT_EQ(
+      tests::failureOf(tests::Host(daemon_, stranger).request("match", {{"flags", std::uint64_t{XTDiscoverAll}}})),
+      "11 unauthorized discovery flag (XTDiscoverAll)");
+  tests::Host managing(daemon_, manager);
+  EXPECT_EQ(managing.offered(), Texts());
+  EXPECT_EQ(managing.offered({}, XTDiscoverAll), Texts({"com.example.dedicated 1.0", "com.example.secret 1.0"}));
 
   setExclusions("no list");
   EXPECT_EQ(match(), Texts{"com.example.plain 1.0"}) << "exclusions are read afresh";

@@ -1,42 +1,33 @@
-// test_host: a host process that a test puts where it needs one (into a bundle, beside an entitlements file).
+// test_host: a host process that a test puts where it needs one (into a bundle, beside an entitlements file) and that
+// passes on what it is told to ask (tests::Host).
 //
-//   test_host RUNTIME SERVICE FLAGS [IDENTIFIER]
+//   test_host RUNTIME SERVICE
 //
-// sends one "match" (for one identifier, or without rules) and prints "identifier version path" of each plug-in that it
-// is offered, sorted, one a line; or "error CODE TEXT".
-#include <cstdio>
-#include <cstdlib>
-#include <set>
+// connects to the daemon, then serves the connected socket that is its standard input: each request is sent to the
+// daemon as its own, and its reply is the daemon's. Ends with its socket, or with status 1 when the daemon has gone.
+#include <unistd.h>
 
-#include "Extora/XTDaemonClient.h"
-#include "Extora/XTVocabulary.h"
-#include "platform/ipc/IpcCodec.h"
+#include "platform/ipc/IpcConnection.h"
 
-using namespace extora;
-using platform::Dictionary;
-using platform::Value;
+using namespace platform;
 
 int main(int argc, char* argv[]) {
-  if (argc < 4) return 2;
-  const platform::SerialQueue queue("test_host");
-  const auto connection = platform::ipcConnectService(argv[1], argv[2], queue);
-  connection->setEventHandler([](const platform::IpcEvent&) {});
-  connection->resume();
-  Dictionary request = {{XTDRequestKey, XTDMatchRequest},
-                        {XTDVersionKey, XTDProtocolVersion},
-                        {XTDFlagsKey, std::uint64_t{std::strtoull(argv[3], nullptr, 0)}}};
-  if (argc > 4) request.set(XTDRulesKey, Dictionary{{XTIdentifierAttribute, std::string(argv[4])}});
-  const auto reply = connection->sendWithReplySync(request);
-  if (const auto error = XTDaemonClient::errorInReply(reply)) {
-    std::printf("error %lld %s\n", static_cast<long long>(error->code), error->localizedDescription().c_str());
-    return 1;
-  }
-  std::set<std::string> lines;
-  const Value forms = platform::fromWireMessage(reply.body[XTDMatchesKey]);
-  for (const Value& form : forms.items()) {
-    lines.insert(form[XTIdentifierFormKey].string() + " " + form[XTVersionFormKey].string() + " " +
-                 form[XTPathFormKey].string() + "\n");
-  }
-  for (const auto& line : lines) std::fputs(line.c_str(), stdout);
-  return 0;
+  if (argc != 3) return 2;
+  const SerialQueue events("events");
+  const SerialQueue orders("orders");
+  const auto daemon = ipcConnectService(argv[1], argv[2], events);
+  daemon->setEventHandler([](const IpcEvent&) {});
+  daemon->resume();
+  const auto controller = ipcConnectionOverSocket(UniqueFd(STDIN_FILENO), orders);
+  controller->setEventHandler([&](const IpcEvent& event) {
+    const auto* order = std::get_if<IpcMessage>(&event);
+    if (order == nullptr) ::_exit(0);
+    const auto answer = daemon->sendWithReplySync(order->body);
+    if (answer.error) ::_exit(1);
+    IpcReply reply = ipcCreateReply(*order);
+    reply.body = Dictionary(answer.body);
+    controller->send(reply);
+  });
+  controller->resume();
+  for (;;) ::pause();
 }
