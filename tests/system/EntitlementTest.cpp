@@ -87,7 +87,9 @@ TEST_F(EntitlementTest, ASandboxedManagerDoesNotSeeEverything) {
 TEST_F(EntitlementTest, HostsUseWhatTheirRestrictionAndThePlugInsRequirementAllow) {
   auto demanding = samplePlugIn("com.example.a");
   tests::setPlugInKey(demanding, std::string(XTHostEntitlementInfoKey), "com.example.key");
-  start({demanding, samplePlugIn("com.example.b")});
+  auto unusable = samplePlugIn("com.example.c");
+  tests::setPlugInKey(unusable, std::string(XTHostEntitlementInfoKey), 7);
+  start({demanding, samplePlugIn("com.example.b"), unusable});
   const auto restrictedTo = [](const Value& rules, const Value& key = true) {
     return Dictionary{{XTAllowedPlugInsEntitlement, rules}, {"com.example.key", key}};
   };
@@ -101,12 +103,14 @@ TEST_F(EntitlementTest, HostsUseWhatTheirRestrictionAndThePlugInsRequirementAllo
       {Value(), unheld, ""},
       {restrictedTo({}), "", ""},
       {restrictedTo({}, "text"), "", ""},
+      {restrictedTo({}, Array()), "", ""},
       {restrictedTo({}, false), unheld, ""},
       {restrictedTo(Dictionary{{XTIdentifierAttribute, "com.example.a"}}), "", unmatched},
       {restrictedTo(Dictionary{{XTIdentifierAttribute, "com.example.a"}}, 0), unheld, unmatched},
       {restrictedTo(Dictionary{{XTIdentifierAttribute, ">com.example.a"}}), unmatched, ""},
       {restrictedTo("com.example.a"), invalid, invalid},
       {restrictedTo(Array{"com.example.a"}), invalid, invalid},
+      {restrictedTo(false), invalid, invalid},
   };
   auto manager = host(Dictionary{{XTManagerEntitlement, true}});
   const auto uuidOf = [&](const std::string& identifier) {
@@ -131,6 +135,10 @@ TEST_F(EntitlementTest, HostsUseWhatTheirRestrictionAndThePlugInsRequirementAllo
                                      "): " + reason + "\n"));
     }
   }
+  auto holder = host(Dictionary{{"7", true}});
+  EXPECT_EQ(ready(holder, uuidOf("com.example.c")),
+            "11 access to plugin com.example.c denied: the host does not have the \"7\" entitlement")
+      << "what is no name cannot be held";
 }
 
 TEST_F(EntitlementTest, OnlyAProviderOfEnvironmentsSendsOne) {
