@@ -31,17 +31,31 @@ const sockaddr* generic(const sockaddr_un& address) {
   return reinterpret_cast<const sockaddr*>(&address);
 }
 
-std::pair<platform::UniqueFd, platform::UniqueFd> socketPair() {
+}  // namespace
+
+SocketPair socketPair() {
   std::array<int, 2> ends{};
   if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends.data()) != 0) std::abort();
   return {platform::UniqueFd(ends[0]), platform::UniqueFd(ends[1])};
 }
 
-}  // namespace
-
 std::string failureOf(const Value& reply) {
   if (!reply["errorcode"]) return {};
   return std::to_string(reply["errorcode"].exactUnsigned()) + " " + reply["error"].string();
+}
+
+platform::Bytes frame(platform::IpcFrameHeader header, const platform::Bytes& body) {
+  header.bodyLength = static_cast<std::uint32_t>(body.size());
+  const auto head = header.serialize();
+  platform::Bytes bytes(head.size() + body.size());
+  std::copy(body.begin(), body.end(), std::copy(head.begin(), head.end(), bytes.begin()));
+  return bytes;
+}
+
+platform::Bytes requestFrame(const Value& body) {
+  platform::Bytes encoded;
+  platform::encodeValue(body, encoded);
+  return frame({.id = 1}, encoded);
 }
 
 Client::Client(const std::string& runtime, const std::string& service)
@@ -160,11 +174,15 @@ std::size_t Daemon::countInLog(std::string_view text) const {
 
 platform::UniqueFd Daemon::connectRaw() const {
   platform::UniqueFd fd(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-  const auto address = addressOf(socket());
-  EXPECT_EQ(::connect(fd.get(), generic(address), sizeof address), 0) << std::strerror(errno);
+  EXPECT_TRUE(connectSocket(fd.get())) << std::strerror(errno);
   const timeval limit{kDeadline.count(), 0};
   ::setsockopt(fd.get(), SOL_SOCKET, SO_RCVTIMEO, &limit, sizeof limit);
   return fd;
+}
+
+bool Daemon::connectSocket(int fd) const {
+  const auto address = addressOf(socket());
+  return ::connect(fd, generic(address), sizeof address) == 0;
 }
 
 std::string Daemon::hostProgram() {
@@ -195,7 +213,7 @@ Host::Host(const Daemon& daemon, const std::filesystem::path& executable, std::v
         return before;
       }()) {}
 
-Host::Host(Pair sockets, const std::vector<std::string>& command)
+Host::Host(SocketPair sockets, const std::vector<std::string>& command)
     : Client(std::move(sockets.first)), program_(command, {}, STDERR_FILENO, sockets.second.get()) {}
 
 }  // namespace tests

@@ -11,10 +11,12 @@
 #include <memory>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "platform/files/UniqueFd.h"
 #include "platform/ipc/IpcConnection.h"
+#include "platform/ipc/IpcFrame.h"
 #include "platform/queue/SerialQueue.h"
 #include "platform/value/Value.h"
 #include "tests/support/RunningProgram.h"
@@ -26,8 +28,17 @@ using platform::Array;
 using platform::Dictionary;
 using platform::Value;
 
+using SocketPair = std::pair<platform::UniqueFd, platform::UniqueFd>;
+/// Two sockets that are connected with each other.
+SocketPair socketPair();
+
 /// "CODE TEXT" of a refused request's reply; "" when it was served.
 std::string failureOf(const Value& reply);
+
+/// A frame of any kind; its length is that of `body`.
+platform::Bytes frame(platform::IpcFrameHeader header, const platform::Bytes& body);
+/// The frame of a request with the id 1.
+platform::Bytes requestFrame(const Value& body);
 
 /// One connection to the daemon.
 class Client {
@@ -91,6 +102,8 @@ class Daemon {
   Client connect(const std::string& service = kService) const { return {runtime().string(), service}; }
   /// A raw connected socket, for bytes that no client would send.
   platform::UniqueFd connectRaw() const;
+  /// Connects a socket that somebody else has made; callable in a forked process.
+  bool connectSocket(int fd) const;
   /// The program of the tests' host (tests/system/TestHost.cpp), to be put into a bundle or beside entitlements.
   static std::string hostProgram();
   /// Writes an application "com.example.<name>" with that program in it; the program's path.
@@ -113,8 +126,7 @@ class Host : public Client {
   pid_t pid() const { return program_.pid(); }
 
  private:
-  using Pair = std::pair<platform::UniqueFd, platform::UniqueFd>;
-  Host(Pair sockets, const std::vector<std::string>& command);
+  Host(SocketPair sockets, const std::vector<std::string>& command);
   RunningProgram program_;
 };
 

@@ -21,25 +21,13 @@ using platform::IpcFrameHeader;
 using platform::Value;
 using tests::Daemon;
 using tests::failureOf;
+using tests::frame;
+using tests::requestFrame;
 
 const Dictionary kFind = {{"request", "find"}, {"version", std::uint64_t{3}}};
 
 // Served before anything that follows it on its connection is looked at, the end included.
 const Dictionary kSyncFind = {{"request", "find"}, {"version", std::uint64_t{3}}, {"sync", true}};
-
-Bytes frame(IpcFrameHeader header, const Bytes& body) {
-  header.bodyLength = static_cast<std::uint32_t>(body.size());
-  const auto head = header.serialize();
-  Bytes bytes(head.begin(), head.end());
-  bytes.insert(bytes.end(), body.begin(), body.end());
-  return bytes;
-}
-
-Bytes requestFrame(const Value& body) {
-  Bytes encoded;
-  platform::encodeValue(body, encoded);
-  return frame({.id = 1}, encoded);
-}
 
 void sendAll(const platform::UniqueFd& fd, const Bytes& bytes) {
   // The daemon may have ended the connection before all is written.
