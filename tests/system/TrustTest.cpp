@@ -153,8 +153,10 @@ TEST_F(TrustTest, AHandedOverSocketIsWorthNothing) {
   EXPECT_EQ(tests::failureOf(receive(socket.get())), "15 Cannot locate PlugIn");
   ASSERT_TRUE(sendAll(socket.get(), find)) << "this is not the process that connected";
   EXPECT_TRUE(receive(socket.get()).isNothing());
-  EXPECT_TRUE(daemon_.waitForLog("client " + std::to_string(owner.peer()->pid()) + " is dead\n"));
-  EXPECT_EQ(daemon_.countInLog("ERROR ops: unexpected error type from ipc: "), 1U);
+  const std::string pid = std::to_string(owner.peer()->pid());
+  EXPECT_TRUE(daemon_.waitForLog("ERROR ops: unexpected error type from ipc: bytes of process " +
+                                 std::to_string(::getpid()) + " on the connection of process " + pid + "\n"));
+  EXPECT_TRUE(daemon_.waitForLog("client " + pid + " is dead\n"));
 }
 
 // The daemon is stopped while a process ends that has asked, and while an entitled one gets its process id.

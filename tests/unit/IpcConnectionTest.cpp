@@ -8,7 +8,6 @@
 #include <sys/mman.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <array>
@@ -285,18 +284,6 @@ TEST(IpcConnectionTest, DescriptorsFromAClientAreClosedAtOnceAndBreakItsConnecti
   EXPECT_TRUE(service.events.waitFor(1).at(0).starts_with("broken: "));
   char byte = 0;
   EXPECT_EQ(::read(in.get(), &byte, 1), 0);  // nobody holds the other end any more
-}
-
-TEST(IpcConnectionTest, BytesOfAnotherProcessBreakTheConnection) {
-  ServiceEnd service;
-  const Bytes frame = request(1, Dictionary{});
-  const pid_t child = ::fork();
-  if (child == 0) ::_exit(::send(service.client->fd(), frame.data(), frame.size(), MSG_NOSIGNAL) > 0 ? 0 : 1);
-  int status = -1;
-  ::waitpid(child, &status, 0);
-  EXPECT_EQ(status, 0);
-  const std::string reason = fmt::format("bytes of process {} on the connection of process {}", child, ::getpid());
-  EXPECT_EQ(service.events.waitFor(2), (Texts{"broken: " + reason, "invalid: " + reason}));
 }
 
 TEST(IpcConnectionTest, ReadingPausesAt32UnservedRequests) {
