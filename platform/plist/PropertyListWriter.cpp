@@ -11,13 +11,15 @@
 namespace platform {
 namespace {
 
+constexpr const char* kTooLong = "a document of this length";
+
 class PropertyListWriter {
  public:
   std::optional<std::string> write(const Value& value, Error* error) {
     out_ = "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<plist version=\"1.0\">\n";
     bool written = writeValue(value, 0);
     out_ += "</plist>\n";
-    if (written && out_.size() > kPropertyListMaxBytes) written = refuse("a document of this length");
+    if (written && out_.size() > kPropertyListMaxBytes) written = refuse(kTooLong);
     if (written) return std::move(out_);
     setError(error, {kPropertyListErrorDomain, kPropertyListErrorWrite,
                      fmt::format("{} cannot be written as a property list", refused_)});
@@ -27,6 +29,7 @@ class PropertyListWriter {
  private:
   bool writeValue(const Value& value, std::size_t depth) {
     if (depth >= kPropertyListMaxDepth) return refuse("a value nested this deep");
+    if (out_.size() > kPropertyListMaxBytes) return refuse(kTooLong);  // no more of it than one value
     switch (value.kind()) {
       case Kind::Nothing:
         return refuse("the nothing value");

@@ -113,6 +113,7 @@ void MainRunLoop::blockSignals() {
   struct sigaction ignore = {};
   ignore.sa_handler = SIG_IGN;
   sigaction(SIGPIPE, &ignore, nullptr);
+  sigaction(SIGXFSZ, &ignore, nullptr);  // a file that may not grow is an error of its write
 }
 
 std::unique_ptr<MainRunLoop::Source> MainRunLoop::addSignal(int signal, std::function<void()> handler) {

@@ -21,7 +21,8 @@ class MainRunLoop {
   /// The loop of the main thread; made on the first call.
   static MainRunLoop& main();  // NOLINT(bugprone-exception-escape): no program entry
 
-  /// Blocks SIGTERM, SIGINT, SIGHUP and SIGCHLD for this thread and all that it starts; ignores SIGPIPE.
+  /// Blocks SIGTERM, SIGINT, SIGHUP and SIGCHLD for this thread and all that it starts; ignores SIGPIPE
+  /// and SIGXFSZ: both are errors of a write then.
   static void blockSignals();
 
   /// Calls `handler` on the main thread each time `signal` arrives. The signal must be blocked.
