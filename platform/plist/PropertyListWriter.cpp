@@ -2,7 +2,7 @@
 #include <nettle/base64.h>
 
 #include <cmath>
-#include <iterator>
+#include <string_view>
 
 #include "platform/plist/PropertyList.h"
 #include "platform/value/DateText.h"
@@ -85,27 +85,32 @@ class PropertyListWriter {
   bool writeText(std::string_view text, std::string_view element, std::size_t depth) {
     if (!isXmlText(text)) return refuse("a string with characters that XML lacks");
     out_.append(depth, '\t');
-    fmt::format_to(std::back_inserter(out_), "<{}>", element);
-    for (const char c : text) {
-      switch (c) {
-        case '&':
-          out_ += "&amp;";
-          break;
-        case '<':
-          out_ += "&lt;";
-          break;
-        case '>':
-          out_ += "&gt;";
-          break;
-        case '\r':
-          out_ += "&#13;";
-          break;  // as it stands a reader would make a line feed of it
-        default:
-          out_ += c;
-      }
+    (out_ += '<').append(element) += '>';
+    std::size_t plain = 0;  // what needs no escape is copied at once
+    for (std::size_t at = 0; at < text.size(); ++at) {
+      const std::string_view escape = escapeOf(text[at]);
+      if (escape.empty()) continue;
+      out_.append(text, plain, at - plain).append(escape);
+      plain = at + 1;
     }
-    fmt::format_to(std::back_inserter(out_), "</{}>\n", element);
+    out_.append(text, plain);
+    (out_ += "</").append(element) += ">\n";
     return true;
+  }
+
+  static std::string_view escapeOf(char c) {
+    switch (c) {
+      case '&':
+        return "&amp;";
+      case '<':
+        return "&lt;";
+      case '>':
+        return "&gt;";
+      case '\r':
+        return "&#13;";  // as it stands a reader would make a line feed of it
+      default:
+        return {};
+    }
   }
 
   bool writeData(const Bytes& bytes, std::size_t depth) {
