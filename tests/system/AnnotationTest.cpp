@@ -164,7 +164,7 @@ TEST_F(AnnotationTest, WhatCannotBeWrittenIsKeptInMemoryAndWrittenLater) {
   EXPECT_EQ(annotate(1, Dictionary{{"election", 2}}), "");
   limitFiles(RLIM_INFINITY);
   EXPECT_EQ(annotate(2, Dictionary{{"election", 3}}), "");
-  EXPECT_EQ(daemon_.countInLog(kUnsaved), 1U);
+  EXPECT_TRUE(daemon_.waitForLog(kUnsaved));
   restart();
   for (int i = 0; i < 3; ++i) EXPECT_TRUE(stored(i)["election"] == Value(i + 1));
 }

@@ -1,6 +1,11 @@
 // Who may use what: every entitlement that the daemon looks at, held and not held, by hosts and plug-ins that are the
 // executables of real bundles.
 #include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
 
 #include "Extora/XTProtocol.h"
 #include "Extora/XTVocabulary.h"
@@ -9,6 +14,7 @@
 namespace extora {
 namespace {
 
+namespace fs = std::filesystem;
 using platform::Array;
 using platform::Dictionary;
 using platform::Value;
@@ -171,7 +177,7 @@ TEST_F(EntitlementTest, APlugInIsElectedByItsOwnEntitlementWhereThatCounts) {
       sampleApplication("com.example.app", {electing("com.example.yes", true), electing("com.example.text", "x"),
                                             electing("com.example.no", false), electing("com.example.zero", 0),
                                             samplePlugIn("com.example.none"), untrusted}));
-  std::filesystem::permissions(pathOf("untrusted.appex/Entitlements.plist"), std::filesystem::perms(0666));
+  fs::permissions(pathOf("untrusted.appex/Entitlements.plist"), fs::perms(0666));
   daemon_.start();
   auto client = daemon_.connect();
   const Texts all = client.offered();
@@ -204,6 +210,53 @@ TEST_F(EntitlementTest, AReplacementSharesTheAnnotationsOfWhatItReplaces) {
   EXPECT_TRUE(electionOf("com.example.r").isNothing()) << "a list names nobody's annotations";
   EXPECT_EQ(elect("com.example.q", 6), "");
   EXPECT_TRUE(electionOf("com.example.p") == Value(6));
+}
+
+// Exclusions and consents: a file that says nothing usable excludes nobody and grants nothing, and holds nobody up.
+TEST_F(EntitlementTest, TheUsersFilesCountAsSoonAsTheyCanBeRead) {
+  start({samplePlugIn("com.example.keyboard", {{"RequestsOpenAccess", true}}, "com.orvane.keyboard-service"),
+         samplePlugIn("com.example.a")});
+  const fs::path preferences = daemon_.config() / "preferences/com.orvane.extora.userprefs.plist";
+  const fs::path consents = daemon_.state() / "consent.plist";
+  const auto text = [](const std::string& content) {
+    return [content](const fs::path& path) { std::ofstream(path) << content; };
+  };
+  const struct {
+    const char* what;
+    std::function<void(const fs::path&)> make;
+    const char* reason;
+  } cases[] = {{"missing", [](const fs::path&) {}, nullptr},
+               {"a directory", [](const fs::path& path) { fs::create_directory(path); }, "POSIX 21"},
+               {"a pipe", [](const fs::path& path) { ::mkfifo(path.c_str(), 0600); }, "POSIX 22"},
+               {"malformed", text("<plist version=\"1.0\"><dict>"), "PropertyList 1"},
+               {"a list", text("<plist version=\"1.0\"><array/></plist>"), "it is not a dictionary"}};
+  auto client = daemon_.connect();
+  const Array keyboard{*platform::Uuid::parse(form("com.example.keyboard")["uuid"].string())};
+  std::size_t assigned = 0;
+  const auto profileIs = [&](const std::string& profile) {
+    EXPECT_EQ(failureOf(client.request("ready", {{"uuids", keyboard}})), "");
+    ASSERT_TRUE(daemon_.waitForLog(" sandbox\n", ++assigned));
+    const std::string log = daemon_.log();
+    EXPECT_TRUE(std::string_view(log).substr(log.rfind("assigning plug-in ")).find(" to " + profile + " sandbox\n") !=
+                std::string::npos);
+  };
+  for (const auto& each : cases) {
+    SCOPED_TRACE(each.what);
+    for (const auto& path : {preferences, consents}) each.make(path);
+    EXPECT_EQ(client.offered().size(), 2U);
+    profileIs("keyboard");
+    for (const auto& path : {preferences, consents}) {
+      EXPECT_TRUE(each.reason == nullptr ||
+                  daemon_.waitForLog("ERROR -: cannot use " + path.string() + ": " + each.reason));
+      fs::remove_all(path);
+    }
+  }
+  tests::writePropertyList(preferences, Dictionary{{XTExclusionsPreferenceKey,
+                                                    Array{Dictionary{{XTIdentifierAttribute, "com.example.a"}}}}});
+  EXPECT_EQ(client.offered(), Texts{"com.example.keyboard 1.0"});
+  const Dictionary granted{{"com.orvane.consent.keyboard-network", true}};
+  tests::writePropertyList(consents, Dictionary{{"com.example.app", granted}});
+  profileIs("plugin");
 }
 
 }  // namespace
