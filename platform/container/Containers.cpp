@@ -6,17 +6,21 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <chrono>
+#include <optional>
 #include <utility>
 
 #include "platform/files/UniqueFd.h"
 #include "platform/files/UserAndGroup.h"
 #include "platform/log/Log.h"
+#include "platform/queue/Mutex.h"
 
 namespace platform {
 namespace {
 
 constexpr unsigned kFolderMode = 0711;
 constexpr unsigned kContainerMode = 0700;
+constexpr std::chrono::seconds kOwnerAge{10};
 
 bool isContainerName(unsigned containerClass, const std::string& identifier) {
   const std::size_t at = identifier.find('@');
@@ -68,7 +72,7 @@ class FileContainers : public Containers {
 
  private:
   // What is inside a container belongs to whoever owns it, who may do anything there meanwhile: no link is followed.
-  int fitOut(const std::string& path, bool forPlugIn) const {
+  int fitOut(const std::string& path, bool forPlugIn) {
     const UniqueFd container = openDirectoryAt(AT_FDCWD, path.c_str());
     if (!container) return errno;
     const UserAndGroup owner = forPlugIn ? plugInOwner() : UserAndGroup{::geteuid(), ::getegid()};
@@ -78,10 +82,15 @@ class FileContainers : public Containers {
     return temporary ? setRight(temporary.get(), owner) : errno;
   }
 
-  UserAndGroup plugInOwner() const {
+  UserAndGroup plugInOwner() {
     const UserAndGroup self{::geteuid(), ::getegid()};
     if (plugInUser_.empty() || self.user != 0) return self;
-    if (const auto owner = UserAndGroup::named(plugInUser_)) return *owner;
+    const auto now = std::chrono::steady_clock::now();
+    const MutexLock lock(mutex_);
+    if (owner_ && now - askedAt_ < kOwnerAge) return *owner_;
+    askedAt_ = now;
+    owner_ = UserAndGroup::named(plugInUser_);
+    if (owner_) return *owner_;
     Log::processDefault().info("there is no user {}; its containers stay with user {}", plugInUser_, self.user);
     return self;
   }
@@ -90,6 +99,10 @@ class FileContainers : public Containers {
   const std::string plugInUser_;
   const bool multiUser_;
   const std::shared_ptr<Files> files_;
+  // Thousands of containers are made in a row, and the directory of users may be a server.
+  Mutex mutex_;
+  std::optional<UserAndGroup> owner_ XT_GUARDED_BY(mutex_);
+  std::chrono::steady_clock::time_point askedAt_ XT_GUARDED_BY(mutex_);
 };
 
 }  // namespace
