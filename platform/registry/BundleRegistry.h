@@ -168,6 +168,8 @@ class BundleRegistry final : public ApplicationRegistry {
     Clock::time_point latest;
   };
   std::map<std::string, Due> due_ XT_GUARDED_BY(queue_);
+  // When the registry is woken for them; at the latest when the first is due.
+  Clock::time_point alarm_ XT_GUARDED_BY(queue_) = Clock::time_point::max();
   bool polling_ XT_GUARDED_BY(queue_) = false;
 
   std::unique_ptr<FolderWatch> watch_;  // null: nothing is watched

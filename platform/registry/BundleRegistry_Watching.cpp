@@ -30,20 +30,24 @@ void BundleRegistry::watchFolders() {
 
 void BundleRegistry::lookAgainAt(const std::string& root, Clock::duration after) {
   const auto now = Clock::now();
+  auto when = now + after;
+  // Thousands of bundles that came together are due together, at a whole second: one look instead of thousands.
+  if (after > kLongest) when = std::chrono::ceil<std::chrono::seconds>(when);
   const auto [place, isNew] = due_.try_emplace(root);
   Due& due = place->second;
-  if (isNew || now + after < due.when) {
-    due = {now + after, now + std::max<Clock::duration>(after, kLongest)};
+  if (isNew || when < due.when) {
+    due = {when, std::max(when, now + kLongest)};
   } else {
-    due.when = std::min(now + after, due.latest);
+    due.when = std::min(when, due.latest);
   }
-  setAlarm();
+  if (due.when < alarm_) watch_->wakeAt(alarm_ = due.when);
 }
 
 void BundleRegistry::setAlarm() {
   const auto first = std::min_element(due_.begin(), due_.end(),
                                       [](const auto& a, const auto& b) { return a.second.when < b.second.when; });
-  if (first != due_.end()) watch_->wakeAt(first->second.when);
+  alarm_ = first == due_.end() ? Clock::time_point::max() : first->second.when;
+  if (first != due_.end()) watch_->wakeAt(alarm_);
 }
 
 void BundleRegistry::takeDue(Roots& roots) {
