@@ -14,7 +14,6 @@ namespace extora {
 
 using platform::Dictionary;
 using platform::InterfaceDescription;
-using platform::IpcConnection;
 using platform::IpcError;
 using platform::Value;
 using Side = InterfaceDescription::Side;

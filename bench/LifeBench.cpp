@@ -20,7 +20,6 @@
 namespace {
 
 namespace fs = std::filesystem;
-using platform::Dictionary;
 using platform::Value;
 using tests::Daemon;
 using Clock = std::chrono::steady_clock;

@@ -1,36 +1,24 @@
-// A plug-in's executable: serves the host that it was started for. It is given one end of a connection as descriptor
-// EXTORA_IPC_FD, answers every request with its own words, and ends when the host has gone.
+// A plug-in's executable: serves the host that it was started for, and ends with it.
 #include <cstdio>
-#include <cstdlib>
 #include <future>
-#include <memory>
-#include <string>
 
-#include "platform/files/UniqueFd.h"
-#include "platform/ipc/IpcConnection.h"
-#include "platform/queue/SerialQueue.h"
+#include "Extora/XTPlugInConnection.h"
+#include "EditingInterface.h"
 
 int main() {
-  const char* descriptor = std::getenv("EXTORA_IPC_FD");
-  if (descriptor == nullptr) {
+  const platform::SerialQueue queue("plug-in");
+  const auto host = extora::XTPlugInConnection::initForPlugIn(queue);
+  if (host == nullptr) {
     std::fputs("A plug-in is not run by hand: a host asks for it, and it is started for that host.\n", stderr);
     return 2;
   }
-
-  static const platform::SerialQueue queue("plug-in");
-  std::promise<void> hostHasGone;
-  const auto connection = platform::ipcConnectionOverSocket(platform::UniqueFd(std::atoi(descriptor)), queue);
-  connection->setEventHandler([&](const platform::IpcEvent& event) {
-    if (const auto* request = std::get_if<platform::IpcMessage>(&event)) {
-      platform::IpcReply reply = platform::ipcCreateReply(*request);
-      reply.body.set("says", "Miaow.");
-      reply.body.set("heard", request->body);
-      connection->send(reply);
-    } else if (const auto* error = std::get_if<platform::IpcError>(&event)) {
-      if (error->kind == platform::IpcError::Kind::ConnectionInvalid) hostHasGone.set_value();
-    }
+  // What does not fit the interface never gets here.
+  host->exportInterface(editingInterface(), [](const std::string&, const platform::Array& arguments) {
+    return extora::XTPlugInConnection::Answer{{"Miaow, " + arguments[0].string() + "."}, {}};
   });
-  connection->resume();
+  std::promise<void> hostHasGone;
+  host->setEndHandler([&] { hostHasGone.set_value(); });
+  host->resume();
   hostHasGone.get_future().wait();
   return 0;
 }

@@ -2,10 +2,9 @@
 
 #include <fmt/format.h>
 
-#include <charconv>
-
 #include "Extora/XTVocabulary.h"
 #include "platform/log/Log.h"
+#include "tools/Activation.h"
 #include "tools/Json.h"
 #include "tools/PlugInReference.h"
 #include "tools/RuleArguments.h"
@@ -16,17 +15,6 @@ using platform::Dictionary;
 using platform::Value;
 
 namespace {
-
-// true, false and whole numbers are stored as such.
-Value valueOf(const std::string& text) {
-  if (text == "true") return true;
-  if (text == "false") return false;
-  std::int64_t number = 0;
-  const char* const end = text.data() + text.size();
-  const auto parsed = std::from_chars(text.data(), end, number);
-  if (!text.empty() && parsed.ptr == end && parsed.ec == std::errc()) return number;
-  return text;
-}
 
 std::string page(const Value& form) {
   std::string text = platform::escapeControlCharacters(
@@ -93,7 +81,7 @@ ExitStatus AnnotateCommand::run(DaemonSession& daemon, std::string& out) {
     for (const std::string& key : remove_) extension.remove(key);
     for (const std::string& entry : set_) {
       const std::size_t equals = entry.find('=');
-      extension.set(entry.substr(0, equals), valueOf(entry.substr(equals + 1)));
+      extension.set(entry.substr(0, equals), typedValue(entry.substr(equals + 1)));
     }
     notes.set(form[extora::XTUUIDFormKey].string(), extension);
     if (changes()) {

@@ -1,6 +1,5 @@
 #include "tools/Election.h"
 
-
 #include <charconv>
 #include <string_view>
 

@@ -11,8 +11,8 @@
 
 namespace tools {
 
-/// What is wrong with one KEY=PATTERN argument, or an empty text: it needs a key and a "=", in UTF-8. `what` says what it
-/// should be.
+/// What is wrong with one KEY=PATTERN argument, or an empty text: it needs a key and a "=", in UTF-8. `what` says what
+/// it should be.
 std::string ruleFault(const std::string& argument, const char* what = "a rule is KEY=PATTERN");
 
 /// The rules dictionary of `arguments`, each faultless, on top of `base`: a key given here replaces the base's entry, a

@@ -6,12 +6,15 @@
 #include <vector>
 
 #include "platform/log/Log.h"
+#include "tools/AccessCommand.h"
 #include "tools/AnnotateCommand.h"
 #include "tools/ElectCommand.h"
 #include "tools/ElectionsCommand.h"
 #include "tools/ExclusionsCommand.h"
 #include "tools/FindCommand.h"
 #include "tools/MatchCommand.h"
+#include "tools/ReadyCommand.h"
+#include "tools/RunCommand.h"
 #include "tools/WatchCommand.h"
 
 namespace {
@@ -47,6 +50,9 @@ int run(int argc, char** argv) {
   commands.push_back(std::make_unique<tools::ElectionsCommand>());
   commands.push_back(std::make_unique<tools::AnnotateCommand>());
   commands.push_back(std::make_unique<tools::ExclusionsCommand>());
+  commands.push_back(std::make_unique<tools::ReadyCommand>());
+  commands.push_back(std::make_unique<tools::AccessCommand>());
+  commands.push_back(std::make_unique<tools::RunCommand>());
   std::vector<CLI::App*> parsers;
   for (const auto& command : commands) parsers.push_back(command->addTo(app));
   for (CLI::App* parser : parsers) parser->fallthrough();  // --service may stand behind the command too

@@ -1,5 +1,5 @@
-// FakeRegistry: an application registry of records that a test hands it; counts what it is asked. Changed by one thread at a
-// time. sampleRecord gives a plug-in that passes the self-check, to be changed before it is installed.
+// FakeRegistry: an application registry of records that a test hands it; counts what it is asked. Changed by one thread
+// at a time. sampleRecord gives a plug-in that passes the self-check, to be changed before it is installed.
 #pragma once
 
 #include <atomic>
