@@ -46,6 +46,7 @@ RunningProgram::RunningProgram(const std::vector<std::string>& arguments,
   int ends[2];
   if (::pipe2(ends, O_CLOEXEC) != 0) std::abort();
   pipe_.reset(ends[0]);
+  ::fcntl(ends[0], F_SETFL, O_NONBLOCK);
   const platform::UniqueFd writeEnd(ends[1]);
   auto argumentTexts = arguments;
   auto environmentTexts = mergedEnvironment(environment);
@@ -73,11 +74,21 @@ RunningProgram::~RunningProgram() {
 }
 
 void RunningProgram::collect() {
+  for (bool ended = false; !ended;) {
+    pollfd readable{pipe_.get(), POLLIN, 0};
+    ::poll(&readable, 1, -1);
+    const platform::MutexLock lock(mutex_);
+    drain();
+    ended = ended_;
+  }
+}
+
+void RunningProgram::drain() const {
   char buffer[4096];
   for (;;) {
     const ssize_t got = ::read(pipe_.get(), buffer, sizeof buffer);
     if (got < 0 && errno == EINTR) continue;
-    const platform::MutexLock lock(mutex_);
+    if (got < 0 && errno == EAGAIN) return;
     if (got <= 0) ended_ = true;
     if (got > 0) output_.append(buffer, static_cast<std::size_t>(got));
     grown_.notify_all();
@@ -108,6 +119,7 @@ int RunningProgram::wait() {
 
 std::string RunningProgram::output() const {
   const platform::MutexLock lock(mutex_);
+  if (!ended_) drain();
   return output_;
 }
 

@@ -38,22 +38,24 @@ class RunningProgram {
   void signal(int number) const;
   /// The exit status (128 + number after a signal); fails the test and kills the process at the deadline.
   int wait();
-  /// What it has written so far; all of it after wait().
+  /// All that it has written so far.
   std::string output() const;
   /// Waits until the output holds `text` at least `count` times; false at the deadline.
   [[nodiscard]] bool waitForOutput(std::string_view text, std::size_t count = 1);
 
  private:
   void collect();
+  // Takes what lies in the pipe.
+  void drain() const XT_REQUIRES(mutex_);
 
   pid_t pid_ = -1;
   platform::UniqueFd pidfd_;
   platform::UniqueFd pipe_;
   std::optional<int> status_;
   mutable platform::Mutex mutex_;
-  std::condition_variable grown_;
-  std::string output_ XT_GUARDED_BY(mutex_);
-  bool ended_ XT_GUARDED_BY(mutex_) = false;
+  mutable std::condition_variable grown_;
+  mutable std::string output_ XT_GUARDED_BY(mutex_);
+  mutable bool ended_ XT_GUARDED_BY(mutex_) = false;
   std::thread collector_;
 };
 
