@@ -6,6 +6,7 @@
 #include <CLI/CLI.hpp>
 
 #include <string>
+#include <vector>
 
 #include "tools/DaemonSession.h"
 #include "tools/ExitStatus.h"
@@ -21,6 +22,9 @@ class Command {
 
   /// Adds its subcommand to `app`, whose parsing then fills this object, and answers it; `app` owns it.
   virtual CLI::App* addTo(CLI::App& app) = 0;
+
+  /// Takes the words behind "--", after the parse; false when the command has no use for them.
+  [[nodiscard]] virtual bool takeWords(std::vector<std::string>) { return false; }
 
   /// Does the work after a successful parse. What belongs on standard output is appended to `out`; complaints have been
   /// written to standard error already.

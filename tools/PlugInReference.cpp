@@ -26,8 +26,7 @@ PlugInReference PlugInReference::parse(const std::string& text) {
   }
   std::error_code error;
   if (text.find('/') == std::string::npos && !std::filesystem::exists(text, error)) return reference;
-  const auto absolute = std::filesystem::absolute(text, error).lexically_normal().string();
-  if (!error) reference.url = Url::file(platform::Files::make()->resolvePath(absolute).value_or(absolute));
+  reference.url = Url::file(absolutePaths({text})[0]);
   return reference;
 }
 
@@ -57,6 +56,16 @@ ExitStatus PlugInReference::find(DaemonSession& daemon, Value& form) const {
   if (form.isDictionary()) return ExitStatus::Success;
   complain("the daemon knows this plug-in but could not describe it; its log says why");
   return ExitStatus::Refused;
+}
+
+std::vector<std::string> absolutePaths(const std::vector<std::string>& paths) {
+  std::vector<std::string> result;
+  for (const auto& path : paths) {
+    std::error_code error;
+    const auto absolute = std::filesystem::absolute(path, error).lexically_normal().string();
+    result.push_back(error ? path : platform::Files::make()->resolvePath(absolute).value_or(absolute));
+  }
+  return result;
 }
 
 std::string plugInReferenceFault(const std::string& text) {

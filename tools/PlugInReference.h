@@ -3,6 +3,7 @@
 
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "platform/value/Url.h"
 #include "platform/value/Uuid.h"
@@ -28,6 +29,9 @@ struct PlugInReference {
   /// with a list of them. Complaints have been written when the status is not Success.
   [[nodiscard]] ExitStatus find(DaemonSession& daemon, platform::Value& form) const;
 };
+
+/// Each path made absolute, and canonical where it exists.
+std::vector<std::string> absolutePaths(const std::vector<std::string>& paths);
 
 /// For an option of the command line: an empty text, or why `text` can name no plug-in.
 std::string plugInReferenceFault(const std::string& text);

@@ -57,15 +57,13 @@ CLI::App* RunCommand::addTo(CLI::App& app) {
   CLI::App* command = app.add_subcommand("run", "Launch a plug-in as its host, and ask it something");
   command->add_option("plug-in", what_, "UUID, path, file URL or identifier")
       ->required()
-      ->option_text("PLUGIN")
+      ->option_text("PLUGIN [-- OPERATION [ARGUMENT...]]")
       ->check(plugInReferenceFault);
-  command->add_option("message", message_, "An operation and its arguments: true, false, whole numbers, else text")
-      ->option_text("[-- OPERATION [ARGUMENT...]]");
   command->add_option("--file", file_, "Send the dictionary of an XML property list as it is")->option_text("FILE");
   addEnvironmentOption(*command, environment_);
   command->footer(R"(Makes the plug-in ready, launches it in its sandbox, sends it one message, and prints the answer as
-JSON. Without a message it only says whether the plug-in came up. The plug-in ends with this
-command. Each step that fails says why; the daemon's log (EXTORA_LOG=debug) says more.
+JSON. An argument true or false is a boolean, a whole number a number, all else text. Without a
+message it only says whether the plug-in came up. The plug-in ends with this command. Each step that fails says why; the daemon's log (EXTORA_LOG=debug) says more.
 
 Examples
   xtctl run com.example.studio.effects -- apply "some text"

@@ -11,6 +11,11 @@ namespace tools {
 class RunCommand : public Command {
  public:
   CLI::App* addTo(CLI::App& app) override;
+  /// An operation and its arguments.
+  bool takeWords(std::vector<std::string> words) override {
+    message_ = std::move(words);
+    return true;
+  }
   ExitStatus run(DaemonSession& daemon, std::string& out) override;
 
  private:

@@ -1,8 +1,10 @@
 // xtctl: looks at a running daemon from a terminal.
+#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
 #include <exception>
 #include <memory>
+#include <string_view>
 #include <vector>
 
 #include "platform/log/Log.h"
@@ -12,8 +14,11 @@
 #include "tools/ElectionsCommand.h"
 #include "tools/ExclusionsCommand.h"
 #include "tools/FindCommand.h"
+#include "tools/HoldCommand.h"
 #include "tools/MatchCommand.h"
 #include "tools/ReadyCommand.h"
+#include "tools/RegistrationCommand.h"
+#include "tools/ReleaseCommand.h"
 #include "tools/RunCommand.h"
 #include "tools/WatchCommand.h"
 
@@ -53,13 +58,24 @@ int run(int argc, char** argv) {
   commands.push_back(std::make_unique<tools::ReadyCommand>());
   commands.push_back(std::make_unique<tools::AccessCommand>());
   commands.push_back(std::make_unique<tools::RunCommand>());
+  commands.push_back(std::make_unique<tools::HoldCommand>());
+  commands.push_back(std::make_unique<tools::ReleaseCommand>());
+  commands.push_back(std::make_unique<tools::RegistrationCommand>(tools::RegistrationCommand::Kind::Add));
+  commands.push_back(std::make_unique<tools::RegistrationCommand>(tools::RegistrationCommand::Kind::Remove));
   std::vector<CLI::App*> parsers;
   for (const auto& command : commands) parsers.push_back(command->addTo(app));
   for (CLI::App* parser : parsers) parser->fallthrough();  // --service may stand behind the command too
 
+  char** const end = argv + argc;
+  char** const mark = std::find_if(argv, end, [](const char* word) { return std::string_view(word) == "--"; });
   try {
-    app.parse(argc, argv);
+    app.parse(static_cast<int>(mark - argv), argv);
     if (app.get_subcommands().empty()) throw CLI::RequiredError("A command");
+    for (std::size_t i = 0; i < commands.size() && mark != end; ++i) {
+      if (parsers[i]->parsed() && !commands[i]->takeWords({mark + 1, end})) {
+        throw CLI::ValidationError("--", parsers[i]->get_name() + " takes nothing behind it");
+      }
+    }
   } catch (const CLI::ParseError& error) {
     if (error.get_exit_code() == 0) return app.exit(error);  // --help, --version
     tools::complain(error.what());

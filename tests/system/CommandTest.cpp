@@ -86,6 +86,49 @@ TEST_F(CommandTest, WatchTellsEachChangeInOrderAndOutlivesTheDaemon) {
   EXPECT_EQ(tests::countOf(watch.output(), "\"time\": "), 5U) << watch.output();
 }
 
+TEST_F(CommandTest, AHoldLastsAsLongAsItsCommandItsTokenOrItself) {
+  const auto a =
+      tests::writeBundle(daemon_.applications(), sampleApplication("com.example.a", {samplePlugIn("com.example.x")}));
+  daemon_.start();
+  auto client = daemon_.connect();
+  const std::string match = XTCTL_BINARY + std::string(" match");
+  const auto held = run({"hold", a, "--", "/bin/sh", "-c", match + "; exit 7"});
+  EXPECT_TRUE(held.starts_with("7:hold ") && held.ends_with("\nNo plug-ins are offered.\n")) << held;
+  EXPECT_EQ(run({"hold", a, "--", "/none"}).substr(0, 4), "127:");
+  EXPECT_EQ(run({"hold", a + "/none"}), "1:xtctl: the daemon refused: invalid path: " + a + "/none (code 9)\n");
+  EXPECT_TRUE(run({"hold", "--", "true"}).starts_with("2:xtctl: path is required\n"));
+  EXPECT_TRUE(run({"release", "x"}).starts_with("2:xtctl: token: \"x\" is no token\n"));
+  EXPECT_EQ(client.offered().size(), 1U);
+
+  auto waiting = start({"hold", a + "/PlugIns/x.appex", "--plug-ins"});
+  ASSERT_TRUE(waiting.waitForOutput("\n"));
+  EXPECT_EQ(client.offered().size(), 0U);
+  EXPECT_TRUE(run({"release", waiting.output().substr(5, 36)}).starts_with("0:no hold "));
+  EXPECT_EQ(client.offered().size(), 1U);
+  waiting.signal(SIGTERM);
+  EXPECT_EQ(waiting.wait(), 0);
+
+  auto stopped = start({"hold", a, "--", "/bin/sleep", "1000"});
+  ASSERT_TRUE(stopped.waitForOutput("\n"));
+  stopped.signal(SIGTERM);
+  EXPECT_EQ(stopped.wait(), 128 + SIGTERM) << "the command's";
+  EXPECT_EQ(client.offered().size(), 1U);
+}
+
+TEST_F(CommandTest, PlugInsAreAddedByAnybodyAndRemovedByManagers) {
+  const auto vendor = daemon_.root() / "vendor";
+  std::filesystem::create_directory(vendor);
+  const auto path = tests::writeBundle(vendor, sampleApplication("com.example.a", {samplePlugIn("com.example.x")})) +
+                    "/PlugIns/x.appex";
+  daemon_.start();
+  EXPECT_EQ(run({"add", path}), "0:added " + path + "\n");
+  EXPECT_EQ(daemon_.connect().offered().size(), 1U);
+  const auto refused = run({"remove", path});
+  EXPECT_TRUE(refused.starts_with("1:") && refused.find("run xtctl-manager") != std::string::npos) << refused;
+  EXPECT_EQ(run({"add", path + ".none"}),
+            "1:xtctl: the daemon refused: invalid plugin path: " + path + ".none (code 9)\n");
+}
+
 TEST_F(CommandTest, ExclusionsAreShownWithWhatIsWrongWithThem) {
   const auto exclusions = [&](const platform::Value& value) {
     tests::writePropertyList(daemon_.config() / "preferences" / "com.orvane.extora.userprefs.plist",

@@ -183,6 +183,9 @@ TEST_F(TerminationTest, ABusyInstanceRefusesAHoldAndAnUninstallEndsIt) {
   EXPECT_TRUE(refused["conflicts"] == Value(Array{Value(Dictionary{{"HBBundleIdentifier", "com.example.a"}})}))
       << refused.describe();
   EXPECT_EQ(refused.size(), 3U);
+  tests::RunningProgram command({XTCTL_BINARY, "hold", mail_, "--refuse-busy"}, daemon_.environment(), STDOUT_FILENO);
+  EXPECT_EQ(command.wait(), 1);
+  EXPECT_EQ(command.output(), "BUSY\ncom.example.a\n");
   EXPECT_EQ(offered(), all_);
   EXPECT_EQ(instance->ask("end"), 0) << "it runs on";
   EXPECT_TRUE(lock(client, Array{mail_}, XTHoldFlagRefuseBusy)["uuids"].isUuid());
