@@ -9,6 +9,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstring>
 
 extern char** environ;
@@ -126,12 +127,15 @@ std::string RunningProgram::output() const {
 bool RunningProgram::waitForOutput(std::string_view text, std::size_t count) {
   const auto deadline = std::chrono::steady_clock::now() + kDeadline;
   platform::MutexLock lock(mutex_);
-  while (countOf(output_, text) < count) {
-    if (ended_ || grown_.wait_until(lock.native(), deadline) == std::cv_status::timeout) {
-      return countOf(output_, text) >= count;
+  std::size_t found = 0;
+  for (std::size_t from = 0;;) {
+    for (auto at = output_.find(text, from); at != std::string::npos; at = output_.find(text, from)) {
+      from = at + text.size();
+      if (++found >= count) return true;
     }
+    from = std::max(from, output_.size() - std::min(output_.size(), text.size()));
+    if (ended_ || grown_.wait_until(lock.native(), deadline) == std::cv_status::timeout) return false;
   }
-  return true;
 }
 
 }  // namespace tests

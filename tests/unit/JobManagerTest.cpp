@@ -164,6 +164,22 @@ TEST_F(JobManagerTest, StubbornInstanceIsKilledAfterTheGracePeriod) {
   EXPECT_TRUE(stubborn.ended());
 }
 
+TEST_F(JobManagerTest, ManyRemovalsOfWhatDoesNotEndCostNoThreads) {
+  const Child host(kIdle);
+  Child stubborn(kIdle);
+  ::kill(stubborn.pid(), SIGSTOP);
+  jobs_ = ProcessJobManager::make(registry_, 3'600'000);
+  start(host, stubborn);
+  constexpr int kRemovals = 10'000;
+  for (int i = 0; i < kRemovals; ++i) remove();
+  EXPECT_EQ(answerCount_, 0);
+  const std::filesystem::directory_iterator threads("/proc/self/task");
+  EXPECT_LT(std::distance(threads, {}), 50) << "none of them waits in a thread of its own";
+  stubborn.end();
+  ASSERT_TRUE(answered(kRemovals));
+  EXPECT_EQ(answer_, 0);
+}
+
 TEST_F(JobManagerTest, DeadInstanceLeavesTheRecordAndARegistrationIsEnough) {
   const Child host(kIdle);
   {
