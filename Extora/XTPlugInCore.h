@@ -58,8 +58,17 @@ class XTPlugInCore {
   /// Completes the plug-in dictionary: attributes and version are present afterwards.
   void canonicalize();
 
-  /// Nothing for a usable plug-in, else an error (code 12) naming the first configuration problem.
+  /// One thing that is wrong with the configuration: the key at fault (empty: none) and its error (code 12).
+  struct Problem {
+    std::string_view key;
+    Error error;
+  };
+  /// Nothing for a usable plug-in, else the error of the first problem.
   virtual std::optional<Error> diagnose() const;
+  /// Everything that is wrong with the record itself, in the order in which it is looked at.
+  std::vector<Problem> configurationProblems() const;
+  /// Everything that is wrong with where it is installed: no data container, or outside of an application.
+  std::vector<Problem> installationProblems() const;
   /// The export form as a new dictionary value. A record that lacks what every form has (Info.plist, path, identifier,
   /// plug-in dictionary, UUID) answers the nothing value and an error (code 12) that names the first thing missing:
   /// "no Info.plist" before all others. A missing original identifier is the identifier.

@@ -115,24 +115,4 @@ void XTPlugInCore::updateFromForm(const Value& form) {
   annotations_ = asDictionary(form[XTAnnotationsFormKey]);
 }
 
-std::optional<Error> XTPlugInCore::diagnose() const {
-  constexpr const char* kMissing = "missing \"{}\" key in Info.plist or SDK";
-  if (identifier_.empty()) {
-    return makeError(XTErrorConfiguration,
-                     "missing identifier (no HXExtensionIdentifier, nor even HBBundleIdentifier)");
-  }
-  if (protocolSpec().isNothing()) return makeErrorWithFormat(XTErrorConfiguration, kMissing, XTProtocolInfoKey);
-  if (attributes().isNothing()) return makeErrorWithFormat(XTErrorConfiguration, kMissing, XTAttributesInfoKey);
-  if (isAppExtension() && principalSpec().string() != XTObjectClassName) {
-    return makeErrorWithFormat(XTErrorConfiguration, "Application Extensions may not use the \"{}\" key",
-                               XTPrincipalClassInfoKey);
-  }
-  if (!pluginKey(XTPassProxyInfoKey).isNothing()) {
-    return makeErrorWithFormat(XTErrorConfiguration, "the \"{}\" key is not supported on this platform",
-                               XTPassProxyInfoKey);
-  }
-  if (isHybrid()) return makeError(XTErrorConfiguration, "hybrid plug-ins are not supported on this platform");
-  return std::nullopt;
-}
-
 }  // namespace extora

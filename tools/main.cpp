@@ -15,6 +15,7 @@
 #include "tools/ExclusionsCommand.h"
 #include "tools/FindCommand.h"
 #include "tools/HoldCommand.h"
+#include "tools/LintCommand.h"
 #include "tools/MatchCommand.h"
 #include "tools/ReadyCommand.h"
 #include "tools/RegistrationCommand.h"
@@ -62,6 +63,7 @@ int run(int argc, char** argv) {
   commands.push_back(std::make_unique<tools::ReleaseCommand>());
   commands.push_back(std::make_unique<tools::RegistrationCommand>(tools::RegistrationCommand::Kind::Add));
   commands.push_back(std::make_unique<tools::RegistrationCommand>(tools::RegistrationCommand::Kind::Remove));
+  commands.push_back(std::make_unique<tools::LintCommand>());
   std::vector<CLI::App*> parsers;
   for (const auto& command : commands) parsers.push_back(command->addTo(app));
   for (CLI::App* parser : parsers) parser->fallthrough();  // --service may stand behind the command too

@@ -12,7 +12,6 @@ namespace {
 
 constexpr std::string_view kDocSourceActionsKey = "HXExtensionDocSourceActions";
 constexpr std::string_view kDocSourceActionNameKey = "HXExtensionDocSourceActionName";
-constexpr std::string_view kSystemFolder = "/System/";
 
 std::optional<std::string> orNothing(const std::string& text) {
   return text.empty() ? std::nullopt : std::optional(text);
@@ -74,13 +73,8 @@ platform::PlugInRecord XTDPlugIn::freshProxy(const std::optional<Uuid>& stamp) c
 
 std::optional<Error> XTDPlugIn::diagnose() const {
   if (std::optional<Error> error = XTPlugInCore::diagnose()) return error;
-  if (!isData() && !dataContainerURL_) {
-    return makeError(XTErrorConfiguration, "this plug-in has no sandbox data container");
-  }
-  if (!containingUrl() && !path().starts_with(kSystemFolder)) {
-    return makeError(XTErrorConfiguration, "plug-ins outside containing apps must be in /System");
-  }
-  return std::nullopt;
+  const auto problems = installationProblems();
+  return problems.empty() ? std::nullopt : std::optional(problems.front().error);
 }
 
 Value XTDPlugIn::infoKey(std::string_view key) const {

@@ -91,7 +91,7 @@ class XTDPlugIn : public XTPlugInCore {
   /// nothing); nothing on success, else an error of code 4.
   std::optional<Error> enableForClient(XTDIpcClient& client, const Value& environment) const;
   /// The name of the sandbox profile that follows from the plug-in's extension point.
-  const char* sandboxProfile() const;
+  std::string_view sandboxProfile() const;
 
   // Sandbox extensions (XTDPlugIn_Sandbox.cpp). Tokens are issued afresh on every call.
   /// Adds "extensions" and "service-extension" to an export form.

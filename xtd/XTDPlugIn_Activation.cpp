@@ -2,6 +2,7 @@
 #include <iterator>
 
 #include "Extora/XTBundle.h"
+#include "Extora/XTExtensionPoints.h"
 #include "Extora/XTLog.h"
 #include "Extora/XTProtocol.h"
 #include "platform/jobs/JobManager.h"
@@ -13,43 +14,20 @@ namespace extora {
 
 namespace {
 
-constexpr const char* kKeyboardService = "com.orvane.keyboard-service";
-constexpr const char* kNetguardFilterData = "com.orvane.netguard.filter-data";
 constexpr const char* kKeyboardNetworkConsent = "com.orvane.consent.keyboard-network";
-constexpr const char* kDefaultProfile = "plugin";
-
-// The profiles that follow from the extension point of the plug-in dictionary alone.
-struct ProfileRow {
-  std::string_view extensionPoint;
-  const char* profile;
-};
-constexpr ProfileRow kProfiles[] = {
-    {"com.orvane.glance.extension.preview", "glanced"},
-    {"com.orvane.glance.preview", "glance-preview"},
-    {"com.orvane.glance.preview.highmemory", "glance-preview"},
-    {"com.orvane.glance.thumbnail", "glance-thumbnail"},
-    {"com.orvane.glance.thumbnail.highmemory", "glance-thumbnail"},
-    {"com.orvane.app.non-ui-extension", "sketchpad-devtools"},
-    {"com.orvane.app.non-ui-extension.multiple-instances", "sketchpad-devtools"},
-    {"com.orvane.callscreen.message-filter", "message-filter"},
-    {"com.orvane.callscreen.classification-ui", "classification-ui"},
-};
 
 }  // namespace
 
-const char* XTDPlugIn::sandboxProfile() const {
+std::string_view XTDPlugIn::sandboxProfile() const {
   const std::string declared = pluginKey(XTSDKInfoKey).string();
-  if (declared == kKeyboardService) {
+  if (declared == XTExtensionPoints::kKeyboardService) {
     const Value openAccess = attribute("RequestsOpenAccess");
     const bool granted = openAccess == Value(true) && allowedConsentServices().count(kKeyboardNetworkConsent) != 0;
-    return granted ? kDefaultProfile : "keyboard";
+    return granted ? XTExtensionPoints::kDefaultProfile : "keyboard";
   }
-  if (declared == kNetguardFilterData) return "network-filter";
+  if (declared == XTExtensionPoints::kNetguardFilterData) return "network-filter";
   const std::string& registered = plugInDictionary()[XTSDKInfoKey].string();
-  for (const ProfileRow& row : kProfiles) {
-    if (row.extensionPoint == registered) return row.profile;
-  }
-  return kDefaultProfile;
+  return XTExtensionPoints::sandboxProfile(registered).value_or(XTExtensionPoints::kDefaultProfile);
 }
 
 std::optional<Error> XTDPlugIn::enableForClient(XTDIpcClient& client, const Value& environment) const {
@@ -62,7 +40,7 @@ std::optional<Error> XTDPlugIn::enableForClient(XTDIpcClient& client, const Valu
   } else {
     XTLogOps().debug("no data container for plug-in {}({}) {} at {}", identifier(), versionText, uuid(), path());
   }
-  const char* profile = sandboxProfile();
+  const std::string_view profile = sandboxProfile();
   if (const char* sdk = std::getenv("XTTEST_SDK")) variables.set("XTTEST_SDK", sdk);
 
   Dictionary service;

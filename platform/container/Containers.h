@@ -33,4 +33,9 @@ inline constexpr const char* kDaemonContainer = "com.orvane.xtd";
 inline constexpr unsigned kDaemonContainerClass = 10;
 inline constexpr unsigned kPlugInContainerClass = 4;
 
+/// Whether a plug-in of this identifier can have a container.
+inline bool isPlugInContainerName(const std::string& identifier) {
+  return isPathSafeName(identifier) && identifier != kDaemonContainer;
+}
+
 }  // namespace platform

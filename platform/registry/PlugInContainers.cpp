@@ -74,7 +74,7 @@ bool PlugInContainers::isFittedOut(const std::string& name) const {
 
 std::string PlugInContainers::containerFor(const BundleRegistration& plugIn, const BundleRegistration* application) {
   const std::string identifier = plugIn.identifier();
-  if (plugIn.isDataOnly() || !isPathSafeName(identifier) || identifier == kDaemonContainer) return {};
+  if (plugIn.isDataOnly() || !isPlugInContainerName(identifier)) return {};
   const std::string name = nameFor(identifier, application == nullptr ? "" : application->bundleIdentifier(),
                                    application == nullptr ? "" : application->path);
   if (isFittedOut(name)) return folder_ + "/" + name;
