@@ -66,15 +66,15 @@ void BundleLint::add(Severity severity, std::string file, std::string_view key, 
 
 void BundleLint::addScanProblems(const std::vector<platform::ScanProblem>& problems) {
   for (const auto& problem : problems) {
-    if (problem.kind == platform::ScanProblem::Kind::Entitlements) {
-      add(Severity::Warning, problem.path + kEntitlements, {}, "the entitlements do not count: " + problem.reason,
-          kTrustAdvice);
-    } else {
-      const bool table = problem.path.ends_with(".plist") || problem.path.ends_with(kLocalization);
-      add(table ? Severity::Warning : Severity::Error, problem.path, {},
-          (table ? "it is not read: " : "it is left out: ") + problem.reason,
-          "mend it; bundles are directories and no links, and their property lists XML 1.0 in UTF-8");
-    }
+    if (problem.kind == platform::ScanProblem::Kind::Entitlements) continue;  // checkBundle looks at all of them
+    const bool inside = problem.path.ends_with(".plist") || problem.path.ends_with(kLocalization);
+    const bool missing = problem.reason.starts_with("no ");
+    const bool link = problem.reason == "it is a link";
+    add(inside ? Severity::Warning : Severity::Error, problem.path, {},
+        (inside ? "it is not read: " : "it is left out: ") + problem.reason,
+        missing ? "add it"
+        : link  ? "put the bundle itself there"
+                : "correct it; property lists are XML 1.0 in UTF-8, names UTF-8");
   }
 }
 
@@ -114,13 +114,6 @@ void BundleLint::checkApplication(const std::string& path) {
     add(Severity::Warning, path + kInfo, "HXTypeDeclarations", "a declaration without HXTypeIdentifier is ignored",
         "add the identifier of the type");
   }
-  if (fs::exists(path + kEntitlements)) {
-    platform::Error refusal;
-    if (platform::entitlementsOfBundle(path, &refusal).isNothing()) {
-      add(Severity::Warning, path + kEntitlements, {}, "the entitlements do not count: " + refusal.describe(),
-          kTrustAdvice);
-    }
-  }
   checkWhatIsNoPlugIn(path + "/" + platform::kPlugInsFolder, group);
   for (const auto& plugIn : group.plugIns) checkPlugIn(*plugIn, path);
 }
@@ -148,6 +141,11 @@ void BundleLint::checkBundle(const BundleRegistration& bundle) {
   const auto directory = platform::openDirectory(bundle.path);
   const Value entitlements = platform::readPropertyListIn(directory.get(), kEntitlements + 1, &stamp, nullptr);
   checkKeys(KeyPlace::Entitlements, entitlements, bundle.path + kEntitlements, report);
+  platform::Error refusal;
+  if (stamp.present() && platform::entitlementsOfBundle(bundle.path, &refusal).isNothing()) {
+    add(Severity::Warning, bundle.path + kEntitlements, {},
+        "the entitlements do not count: " + refusal.localizedDescription(), kTrustAdvice);
+  }
   checkLocalization(bundle.path);
 }
 
@@ -166,7 +164,7 @@ void BundleLint::checkExecutable(const BundleRegistration& bundle, bool needed) 
   if (!executable) {
     warn("it leads to no place below the bundle", "name a path below the bundle");
   } else if (::stat(executable->c_str(), &status) != 0) {
-    warn(fmt::format("there is no {}", bundle.info[kKey].string()), "add the file, or correct its name");
+    warn(fmt::format("there is no file \"{}\"", bundle.info[kKey].string()), "add the file, or correct its name");
   } else if (!S_ISREG(status.st_mode)) {
     warn(fmt::format("{} is no file", bundle.info[kKey].string()), "name a file");
   } else if ((status.st_mode & (S_IXUSR | S_IXGRP | S_IXOTH)) != (S_IXUSR | S_IXGRP | S_IXOTH)) {
@@ -249,6 +247,7 @@ void BundleLint::checkRecord(const BundleRegistration& plugIn, const std::string
   }
   for (const auto& problem : record.installationProblems()) {
     // Where it lies while its author looks at it need not be where it is installed.
+    if (record.identifier().empty()) continue;  // said already
     const bool place = record.isData() || record.dataContainerURL().has_value();
     add(place ? Severity::Warning : Severity::Error, place ? plugIn.path : info,
         place ? "" : extora::HBBundleIdentifierKey, problem.error.localizedDescription(),

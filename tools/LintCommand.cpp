@@ -104,7 +104,9 @@ ExitStatus LintCommand::run(DaemonSession& daemon, std::string& out) {
   const XTExtensionPoints points = pointsOf(directories, paths);
   BundleLint lint(points, directories.profiles);
   for (const std::string& path : paths) lint.check(path);
-  const auto& findings = lint.findings();
+  auto findings = lint.findings();
+  std::stable_sort(findings.begin(), findings.end(),
+                   [](const Finding& a, const Finding& b) { return a.file < b.file; });
 
   if (json_) {
     for (const Finding& finding : findings) out += jsonLine(recordOf(finding));

@@ -46,7 +46,7 @@ constexpr KnownKey kKeys[] = {
     {KeyPlace::PlugIn, XTProtocolInfoKey, Kind::Text, kIgnored},
     {KeyPlace::PlugIn, XTPrincipalClassInfoKey, Kind::Text, kIgnored},
     {KeyPlace::PlugIn, XTDedicatedInfoKey, Kind::Boolean, kIgnored},
-    {KeyPlace::PlugIn, XTHostEntitlementInfoKey, Kind::Text, kIgnored},
+    {KeyPlace::PlugIn, XTHostEntitlementInfoKey, Kind::Text, "no host may use the plug-in"},
     {KeyPlace::PlugIn, XTHubProtocolVersionInfoKey, Kind::Number, "it counts as 0"},
     {KeyPlace::PlugIn, XTSharedResourcesInfoKey, Kind::Texts, kIgnored},
     {KeyPlace::PlugIn, XTCleanTimeoutInfoKey, Kind::Any, nullptr},

@@ -382,7 +382,9 @@ TEST_F(LaunchTest, ExtensionsAreConsumedOnceAndReleasedByWhoConsumedThem) {
     EXPECT_EQ(extension.descriptor(), -1);
     extension.consume();
   }
-  XTSandboxExtension forged("0" + token.substr(1));
+  std::string other = token;
+  other[0] = token[0] == '0' ? '1' : '0';
+  XTSandboxExtension forged(other);
   forged.consume();
   EXPECT_EQ(forged.handle(), -1);
 
@@ -393,7 +395,7 @@ TEST_F(LaunchTest, ExtensionsAreConsumedOnceAndReleasedByWhoConsumedThem) {
                        "DEBUG sandbox: consuming extension " + shown + " -> 1",
                        "DEFAULT sandbox: failed to release extension 1 - errno=22",
                        "DEBUG sandbox: consuming extension " + shown + " -> 2", "DEBUG sandbox: releasing extension 2",
-                       "DEFAULT sandbox: failed to consume extension " + ("0" + token.substr(1, 7)) + " - errno=13"}));
+                       "DEFAULT sandbox: failed to consume extension " + other.substr(0, 8) + " - errno=13"}));
 }
 
 TEST_F(LaunchTest, TokensAreWorthWhatTheDaemonThatIssuedThemSays) {
