@@ -8,7 +8,7 @@
 //   ignore-term              from here on SIGTERM has no effect
 //
 // Outside of a sandbox, `probe_plugin launch EXECUTABLE` asks the host services for that and exits with the error
-// number.
+// number; `probe_plugin host EXECUTABLE` has the daemon make the plug-in ready first.
 #include <arpa/inet.h>
 #include <fcntl.h>
 #include <net/if.h>
@@ -28,6 +28,7 @@
 #include <iterator>
 #include <string_view>
 
+#include "Extora/XTDaemonClient.h"
 #include "Extora/XTHostServices.h"
 #include "platform/ipc/IpcConnection.h"
 
@@ -138,12 +139,27 @@ Dictionary serve(const Value& request) {
   return {{"errno", number}};
 }
 
-int launch(const char* executable, bool untilReady) {
+// False when the daemon does not make the plug-in of that executable ready for this process.
+bool makeReady(const std::filesystem::path& executable) {
+  const auto client = extora::XTDaemonClient::initWithServiceName(std::nullopt);
+  const auto answerTo = [](const auto& send) {
+    std::promise<Value> answer;
+    send([&](const platform::IpcReplyObject& reply) { answer.set_value(reply.body); });
+    return answer.get_future().get();
+  };
+  const auto bundle = platform::Url::file(executable.parent_path().native());
+  const Value found = answerTo([&](const auto& reply) { client->findPlugInByPathURL(bundle, reply); });
+  const auto uuid = platform::Uuid::parse(client->convertFromIPC(found["matches"])["uuid"].string());
+  if (!uuid) return false;
+  return answerTo([&](const auto& reply) {
+           client->readyPlugIns({std::pair(bundle.path(), *uuid)}, false, 0, {}, reply);
+         })["error"]
+      .isNothing();
+}
+
+int launch(const char* executable) {
   extora::Error error;
-  std::optional<extora::XTHostServices::Launched> launched;
-  do {
-    launched = extora::XTHostServices::launch(executable, &error);
-  } while (untilReady && !launched && error.code == EPERM);
+  const auto launched = extora::XTHostServices::launch(executable, &error);
   if (!launched) return static_cast<int>(error.code);
   std::printf("%d\n", static_cast<int>(launched->pid));
   return 0;
@@ -160,7 +176,10 @@ void terminated(int) {
 }  // namespace
 
 int main(int argc, char* argv[]) {
-  if (argc == 3) return launch(argv[2], argv[1] == std::string_view("launch-when-ready"));
+  if (argc == 3) {
+    if (argv[1] == std::string_view("host") && !makeReady(argv[2])) return 1;
+    return launch(argv[2]);
+  }
   listDescriptors();
   if (const char* home = std::getenv("HOME")) terminatedPath = std::string(home) + "/terminated";
   ::signal(SIGTERM, terminated);

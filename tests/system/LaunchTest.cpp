@@ -1,8 +1,9 @@
-// Plug-ins that really run: launched by the platform's host services, seen from the host, from inside the sandbox
-// (tests/support/ProbePlugIn.cpp) and from the outside. The daemon is tests/system/LaunchDaemon.cpp.
+// Plug-ins that really run: made ready and launched through a running daemon, seen from the host, from inside the
+// sandbox (tests/support/ProbePlugIn.cpp) and from the outside.
 #include <arpa/inet.h>
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <linux/sched.h>
 #include <signal.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
@@ -18,9 +19,11 @@
 #include <thread>
 
 #include "Extora/XTHostServices.h"
+#include "Extora/XTProtocol.h"
 #include "Extora/XTSandboxExtension.h"
 #include "platform/hostservices/HostServicesProtocol.h"
 #include "tests/support/Daemon.h"
+#include "tests/support/Eventually.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/SampleBundles.h"
 
@@ -59,15 +62,6 @@ bool ended(pid_t pid) {
   return !pidfd || !platform::PeerIdentity::ofPidfd(pidfd.get())->isAlive();
 }
 
-bool waitFor(const std::function<bool()>& condition) {
-  const auto deadline = std::chrono::steady_clock::now() + tests::kDeadline;
-  while (!condition()) {
-    if (std::chrono::steady_clock::now() > deadline) return false;
-    std::this_thread::yield();
-  }
-  return true;
-}
-
 // A launched probe and the host's connection to it.
 class Probe {
  public:
@@ -97,72 +91,90 @@ class LaunchTest : public testing::Test {
  protected:
   LaunchTest() {
     // Whoever plug-ins run as must be able to reach what is theirs.
-    fs::permissions(place_.root(), fs::perms(0755));
-    place_.setEnvironment("EXTORA_PROFILES", PROFILES);
-    place_.setEnvironment("EXTORA_PLUGIN_USER", std::to_string(plugInUser()));
-    ::setenv("EXTORA_RUNTIME_DIR", place_.runtime().c_str(), 1);
-    tests::SampleBundle plugIn = tests::samplePlugIn(kIdentifier);
-    plugIn.program = PROBE_BINARY;
-    bundle_ =
-        tests::installBundle(place_.applications(), tests::sampleApplication("com.example.app", {std::move(plugIn)})) +
-        "/PlugIns/probe.appex";
-    executable_ = bundle_ + "/plugin";
-  }
-  ~LaunchTest() override {
-    if (daemon_ != nullptr && testing::Test::HasFailure()) std::cerr << daemon_->output();
+    fs::permissions(daemon_.root(), fs::perms(0755));
+    daemon_.setEnvironment("EXTORA_PROFILES", PROFILES);
+    daemon_.setEnvironment("EXTORA_PLUGIN_USER", std::to_string(plugInUser()));
+    ::setenv("EXTORA_RUNTIME_DIR", daemon_.runtime().c_str(), 1);
   }
 
   static uid_t plugInUser() { return ::geteuid() == 0 ? kNobody : ::geteuid(); }
-  std::string container() const { return place_.state() / "Containers" / kIdentifier; }
+  std::string container() const { return daemon_.state() / "Containers" / kIdentifier; }
 
-  void start() {
-    daemon_ = std::make_unique<tests::RunningProgram>(std::vector<std::string>{DAEMON_BINARY}, place_.environment(),
-                                                      STDERR_FILENO);
-    ASSERT_TRUE(daemon_->waitForOutput("serving"));
-    xtd_ = std::make_unique<tests::Client>(place_.runtime(), "com.example.launches");
+  // An application with one probe, whose Info.plist declares these variables, and a daemon that offers it.
+  void start(const Dictionary& variables = {}, const std::string& point = "com.example.point") {
+    install(variables, point);
+    daemon_.start();
+    client_ = std::make_unique<tests::Client>(daemon_.runtime(), tests::Daemon::kService);
   }
-
-  int ready(Dictionary variables = {}, const std::string& profile = "plugin", pid_t host = 0) {
-    variables.set("HOME", container());
-    const Dictionary service{{"EnvironmentVariables", variables}, {"_SandboxProfile", profile}};
-    Dictionary request{{"ask", "ready"}, {"executable", executable_}, {"overlay", Dictionary{{"IPCService", service}}}};
-    if (host != 0) request.set("pid", host);
-    return static_cast<int>(xtd_->send(request)["result"].integerValue());
+  void install(const Dictionary& variables, const std::string& point) {
+    tests::SampleBundle plugIn = tests::samplePlugIn(kIdentifier, {}, point);
+    plugIn.program = PROBE_BINARY;
+    plugIn.info.set("IPCService", Dictionary{{"EnvironmentVariables", variables}});
+    application_ = tests::installBundle(daemon_.applications(), tests::sampleApplication("com.example.app", {plugIn}));
+    bundle_ = application_ + "/PlugIns/probe.appex";
+    executable_ = bundle_ + "/plugin";
   }
+  Value form() {
+    platform::Array forms;
+    EXPECT_TRUE(tests::eventually([&] { return (forms = client_->match({})).size() == 1; }));
+    return forms.size() == 1 ? forms[0] : Value();
+  }
+  // "", or why the probe cannot be made ready for the host `client`.
+  static std::string readyFor(tests::Client& client, const Value& form) {
+    const Value uuid = *platform::Uuid::parse(form["uuid"].string());
+    return tests::failureOf(client.request("ready", {{"uuids", platform::Array{uuid}}}));
+  }
+  std::string ready() { return readyFor(*client_, form()); }
   // The probe, or null and the error in error_.
   std::unique_ptr<Probe> launch() {
     error_ = {};
     auto launched = XTHostServices::launch(executable_, &error_);
     return launched ? std::make_unique<Probe>(std::move(*launched)) : nullptr;
   }
-  std::int64_t remove() {
-    return xtd_->send({{"ask", "remove"}, {"identifier", kIdentifier}, {"version", "1"}})["result"].integerValue();
+  // Ends all instances of the probe, and waits for it.
+  void terminate() {
+    const Value hold = client_->request(
+        "lock", {{"paths", platform::Array{application_}}, {"flags", std::uint64_t{XTHoldFlagTerminate}}});
+    EXPECT_EQ(tests::failureOf(client_->request("lock", {{"uuids", platform::Array{hold["uuids"]}}})), "");
   }
-  Value instances() { return xtd_->send({{"ask", "instances"}, {"identifier", kIdentifier}}); }
-  bool isBusy() { return instances()["busy"].size() != 0; }
-  std::string issue(const std::string& path) {
-    return xtd_->send({{"ask", "issue"}, {"path", path}, {"boundary", bundle_}})["token"].string();
+  bool isBusy() {
+    const Value reply = client_->request(
+        "lock", {{"paths", platform::Array{application_}}, {"flags", std::uint64_t{XTHoldFlagRefuseBusy}}});
+    if (reply["conflicts"]) return true;
+    (void)client_->request("lock", {{"uuids", platform::Array{reply["uuids"]}}});
+    return false;
+  }
+  // The exit status of a program that asks for a launch of the probe.
+  int launchElsewhere(const char* how) {
+    tests::RunningProgram other({PROBE_BINARY, how, executable_}, daemon_.environment(), STDOUT_FILENO);
+    const int status = other.wait();
+    elsewhere_ = other.pid();
+    said_ = other.output();
+    return status;
   }
 
-  tests::Daemon place_;  // its folders; no xtd is started
+  tests::Daemon daemon_;
+  std::string application_;
   std::string bundle_;
   std::string executable_;
-  std::unique_ptr<tests::RunningProgram> daemon_;
-  std::unique_ptr<tests::Client> xtd_;
+  std::unique_ptr<tests::Client> client_;
   Error error_;
+  pid_t elsewhere_ = 0;
+  std::string said_;
 };
 
 TEST_F(LaunchTest, SeesItsOwnAndTheSystemAndNothingElse) {
-  std::ofstream(place_.root() / "secret") << "secret";
-  fs::permissions(place_.root() / "secret", fs::perms(0666));
-  start();
-  ASSERT_EQ(ready({{"COLOUR", "green"}, {"COUNT", 7}, {"EXTORA_IPC_FD", "8"}}), 0);
+  std::ofstream(daemon_.root() / "secret") << "secret";
+  fs::permissions(daemon_.root() / "secret", fs::perms(0666));
+  start({{"COLOUR", "green"}, {"COUNT", 7}, {"EXTORA_IPC_FD", "8"}});
+  ASSERT_EQ(ready(), "");
   const auto probe = launch();
   ASSERT_NE(probe, nullptr) << error_.describe();
   const Value report = probe->ask({{"ask", "report"}});
 
   EXPECT_EQ(setOf(report["environment"]),
-            (std::set<std::string>{"COLOUR=green", "COUNT=7", "EXTORA_IPC_FD=3", "HOME=" + container()}));
+            (std::set<std::string>{"COLOUR=green", "COUNT=7", "EXTORA_IPC_FD=3", "HOME=" + container(),
+                                   "HBFIXED_USER_HOME=" + container(), "TMPDIR=" + container() + "/tmp"}));
   const auto descriptors = setOf(report["descriptors"]);
   EXPECT_EQ(descriptors.size(), 4U) << report["descriptors"].describe();
   for (const char* number : {"0", "1", "2"}) EXPECT_EQ(descriptors.count(std::string(number) + " /dev/null"), 1U);
@@ -191,13 +203,13 @@ TEST_F(LaunchTest, SeesItsOwnAndTheSystemAndNothingElse) {
   EXPECT_TRUE(fs::exists(container() + "/new"));
   EXPECT_EQ(probe->open("/tmp/extora-probe", create), 0);
   EXPECT_FALSE(fs::exists("/tmp/extora-probe")) << "its /tmp is private";
-  for (const fs::path& outside : {place_.root() / "secret", fs::path("/etc/passwd"), fs::path("/root"),
-                                  place_.applications() / "app.app/Info.plist", place_.state() / "lock"}) {
+  for (const fs::path& outside : {daemon_.root() / "secret", fs::path("/etc/passwd"), fs::path("/root"),
+                                  daemon_.applications() / "app.app/Info.plist", daemon_.state() / "lock"}) {
     EXPECT_EQ(probe->open(outside), ENOENT) << outside;
   }
-  const auto socket = [&](const char* service) { return place_.socket(service).string(); };
+  const auto socket = [&](const char* service) { return daemon_.socket(service).string(); };
   EXPECT_EQ(probe->result({{"ask", "connect"}, {"path", socket(platform::kHostServices)}}), 0);
-  EXPECT_EQ(probe->result({{"ask", "connect"}, {"path", socket("com.example.launches")}}), ENOENT);
+  EXPECT_EQ(probe->result({{"ask", "connect"}, {"path", socket(tests::Daemon::kService)}}), ENOENT);
 }
 
 TEST_F(LaunchTest, NetworkIsThereForProfilesThatGrantIt) {
@@ -210,26 +222,51 @@ TEST_F(LaunchTest, NetworkIsThereForProfilesThatGrantIt) {
   ASSERT_EQ(::listen(server.get(), 4), 0);
   ASSERT_EQ(::getsockname(server.get(), reinterpret_cast<sockaddr*>(&address), &size), 0);
   const Dictionary tcp{{"ask", "tcp"}, {"port", ntohs(address.sin_port)}};
-  start();
-  ASSERT_EQ(ready({}, "keyboard"), 0);
-  const auto confined = launch();
-  ASSERT_NE(confined, nullptr) << error_.describe();
-  EXPECT_EQ(confined->result(tcp), ECONNREFUSED) << "nobody listens on its own loopback";
-  ASSERT_EQ(ready({}, "sketchpad-devtools"), 0);
-  const auto connected = launch();
-  ASSERT_NE(connected, nullptr) << error_.describe();
-  EXPECT_EQ(connected->result(tcp), 0);
+  for (const auto& [point, result] :
+       {std::pair{"com.orvane.keyboard-service", ECONNREFUSED}, {"com.orvane.app.non-ui-extension", 0}}) {
+    if (!client_) start({}, point);
+    if (point != form()["info"]["HXExtensionPointIdentifier"].string()) install({}, point);
+    ASSERT_TRUE(tests::eventually([&] { return form()["info"]["HXExtensionPointIdentifier"] == Value(point); }));
+    ASSERT_EQ(ready(), "");
+    const auto probe = launch();
+    ASSERT_NE(probe, nullptr) << error_.describe();
+    EXPECT_EQ(probe->result(tcp), result) << point << ": nobody listens on a loopback of its own";
+  }
 }
 
-TEST_F(LaunchTest, EveryProfileOfTheTableShipsAndSaysWhatItGrants) {
-  start();
-  for (const char* name : {"plugin", "keyboard", "network-filter", "glanced", "glance-preview", "glance-thumbnail",
-                           "sketchpad-devtools", "message-filter", "classification-ui"}) {
-    ASSERT_EQ(ready({}, name), 0);
-    EXPECT_NE(launch(), nullptr) << name << ": " << error_.describe();
-    EXPECT_NE(textOf(fs::path(PROFILES) / (std::string(name) + ".plist")).find("<key>Description</key>"),
-              std::string::npos)
-        << name;
+TEST_F(LaunchTest, EachExtensionPointHasItsProfileWhichShipsAndSaysWhatItGrants) {
+  const std::vector<std::pair<std::string, std::string>> rows = {
+      {"com.example.point", "plugin"},
+      {"com.orvane.keyboard-service", "keyboard"},
+      {"com.orvane.netguard.filter-data", "network-filter"},
+      {"com.orvane.glance.extension.preview", "glanced"},
+      {"com.orvane.glance.preview", "glance-preview"},
+      {"com.orvane.glance.preview.highmemory", "glance-preview"},
+      {"com.orvane.glance.thumbnail", "glance-thumbnail"},
+      {"com.orvane.glance.thumbnail.highmemory", "glance-thumbnail"},
+      {"com.orvane.app.non-ui-extension", "sketchpad-devtools"},
+      {"com.orvane.app.non-ui-extension.multiple-instances", "sketchpad-devtools"},
+      {"com.orvane.callscreen.message-filter", "message-filter"},
+      {"com.orvane.callscreen.classification-ui", "classification-ui"},
+  };
+  std::vector<tests::SampleBundle> plugIns;
+  for (std::size_t i = 0; i < rows.size(); ++i) {
+    plugIns.push_back(tests::samplePlugIn("com.example.p" + std::to_string(i), {}, rows[i].first));
+    plugIns.back().program = PROBE_BINARY;
+  }
+  const auto folder = tests::writeBundle(daemon_.applications(), tests::sampleApplication("com.example.all", plugIns));
+  daemon_.start();
+  auto client = daemon_.connect();
+  for (std::size_t i = 0; i < rows.size(); ++i) {
+    const auto name = "p" + std::to_string(i);
+    const auto& [point, profile] = rows[i];
+    const auto forms = client.match({{"HXExtensionIdentifier", "=com.example." + name}});
+    ASSERT_EQ(forms.size(), 1U);
+    ASSERT_EQ(readyFor(client, forms[0]), "") << point;
+    EXPECT_EQ(daemon_.countInLog(forms[0]["uuid"].string() + " to " + profile + " sandbox\n"), 1U) << point;
+    executable_ = folder + "/PlugIns/" + name + ".appex/plugin";
+    EXPECT_NE(launch(), nullptr) << point << ": " << error_.describe();
+    EXPECT_NE(textOf(fs::path(PROFILES) / (profile + ".plist")).find("<key>Description</key>"), std::string::npos);
   }
 }
 
@@ -238,8 +275,8 @@ TEST_F(LaunchTest, VariablesOfABundleActOnThePlugInAlone) {
   GTEST_SKIP() << "the address sanitizer ends a program that has something preloaded before its runtime";
 #endif
   constexpr const char* kLibrary = "libBrokenLocale.so.1";
-  start();
-  ASSERT_EQ(ready({{"LD_PRELOAD", kLibrary}, {"LD_LIBRARY_PATH", bundle_}}), 0);
+  start({{"LD_PRELOAD", kLibrary}, {"LD_LIBRARY_PATH", "/nowhere"}});
+  ASSERT_EQ(ready(), "");
   const auto probe = launch();
   ASSERT_NE(probe, nullptr) << error_.describe();
   EXPECT_NE(probe->ask({{"ask", "report"}})["libraries"].string().find(kLibrary), std::string::npos);
@@ -258,52 +295,68 @@ TEST_F(LaunchTest, VariablesOfABundleActOnThePlugInAlone) {
 }
 
 TEST_F(LaunchTest, OnlyTheVeryProcessThatWasMadeReadyForMayLaunch) {
+  const auto host = daemon_.writeHost("host");
   start();
-  const auto launchElsewhere = [&] {
-    tests::RunningProgram other({PROBE_BINARY, "launch", executable_}, place_.environment(), STDOUT_FILENO);
-    return other.wait();
-  };
   EXPECT_EQ(launch(), nullptr);
   EXPECT_EQ(error_.code, EPERM) << "nobody has been made ready for";
-  ASSERT_EQ(ready(), 0);
-  EXPECT_EQ(launchElsewhere(), EPERM) << "the host's own child";
+  ASSERT_EQ(ready(), "");
+  EXPECT_EQ(launchElsewhere("launch"), EPERM) << "the host's own child";
   EXPECT_NE(launch(), nullptr) << error_.describe();
-
-  ASSERT_EQ(remove(), 0);
-  tests::RunningProgram stranger({"/bin/sleep", "1000"}, {}, STDOUT_FILENO);
-  ASSERT_EQ(ready({}, "plugin", stranger.pid()), 0);
+  terminate();
+  tests::Host stranger(daemon_, host);
+  ASSERT_EQ(readyFor(stranger, form()), "");
   EXPECT_EQ(launch(), nullptr) << "made ready for somebody else";
   EXPECT_EQ(error_.code, EPERM);
 
-  ASSERT_EQ(ready(), 0);
-  tests::removeBundle(place_.applications() / "app.app");
-  EXPECT_TRUE(waitFor([&] { return launch() == nullptr && error_.code == EPERM; })) << "its bundle has gone";
+  ASSERT_EQ(launchElsewhere("host"), 0) << "it has been made ready for, and has ended";
+  pid_t wanted = elsewhere_;
+  struct clone_args arguments = {};
+  arguments.exit_signal = SIGCHLD;
+  arguments.set_tid = reinterpret_cast<std::uintptr_t>(&wanted);
+  arguments.set_tid_size = 1;
+  const auto recycled = static_cast<pid_t>(::syscall(SYS_clone3, &arguments, sizeof arguments));
+  if (recycled == 0) {
+    ::execl(PROBE_BINARY, PROBE_BINARY, "launch", executable_.c_str(), nullptr);
+    ::_exit(0);
+  }
+  if (recycled > 0) {  // else this user may not choose process ids
+    int status = 0;
+    EXPECT_EQ(::waitpid(recycled, &status, 0), elsewhere_);
+    EXPECT_EQ(WEXITSTATUS(status), EPERM) << "another process of the same number";
+  }
+
+  ASSERT_EQ(ready(), "");
+  tests::removeBundle(application_);
+  EXPECT_TRUE(tests::eventually([&] { return launch() == nullptr && error_.code == EPERM; })) << "its bundle has gone";
 }
 
 TEST_F(LaunchTest, WhatCannotBeLaunchedIsRefusedWithItsReason) {
+  const auto profiles = daemon_.root() / "profiles";
+  fs::copy(fs::path(PROFILES) / "plugin.plist", profiles);
+  daemon_.setEnvironment("EXTORA_PROFILES", profiles);
   start();
-  ASSERT_EQ(ready({}, "no-such-profile"), 0);
+  ASSERT_EQ(ready(), "");
+  fs::rename(profiles / "plugin.plist", profiles / "other.plist");
   EXPECT_EQ(launch(), nullptr);
-  EXPECT_EQ(error_.code, ENOENT);
-  ASSERT_EQ(ready(), 0);
+  EXPECT_EQ(error_.code, ENOENT) << "no profile";
+  fs::rename(profiles / "other.plist", profiles / "plugin.plist");
   std::ofstream(executable_, std::fstream::trunc) << "no program";
   EXPECT_EQ(launch(), nullptr);
   EXPECT_EQ(error_.code, ENOEXEC) << "the kernel's own word";
-  EXPECT_TRUE(waitFor([&] { return instances()["pids"].size() == 0; }));
 }
 
 TEST_F(LaunchTest, APlugInNeverRunsAsRoot) {
-  place_.setEnvironment("EXTORA_PLUGIN_USER", "0");
+  daemon_.setEnvironment("EXTORA_PLUGIN_USER", "0");
   start();
-  ASSERT_EQ(ready(), 0);
+  ASSERT_EQ(ready(), "");
   EXPECT_EQ(launch(), nullptr);
   EXPECT_EQ(error_.code, EPERM);
 }
 
-TEST_F(LaunchTest, RemovalEndsRunningStubbornAndDeadInstances) {
-  place_.setEnvironment("EXTORA_TERMINATION_GRACE_MS", "100");
+TEST_F(LaunchTest, AHoldEndsRunningStubbornAndDeadInstances) {
+  daemon_.setEnvironment("EXTORA_TERMINATION_GRACE_MS", "100");
   start();
-  ASSERT_EQ(ready(), 0);
+  ASSERT_EQ(ready(), "");
   const auto willing = launch();
   const auto stubborn = launch();
   const auto dead = launch();
@@ -311,49 +364,37 @@ TEST_F(LaunchTest, RemovalEndsRunningStubbornAndDeadInstances) {
   ASSERT_EQ(stubborn->result({{"ask", "ignore-term"}}), 0);
   ::kill(dead->pid, SIGKILL);
   ASSERT_EQ(willing->result({{"ask", "nothing"}}), EINVAL) << "it runs";
-  EXPECT_EQ(remove(), 0);
+  terminate();
   EXPECT_TRUE(fs::exists(container() + "/terminated")) << "SIGTERM has reached the plug-in";
   for (const auto* probe : {&willing, &stubborn, &dead}) EXPECT_TRUE(ended((*probe)->pid));
-  EXPECT_EQ(instances()["pids"].size(), 0U);
-  EXPECT_EQ(remove(), 3);
+  EXPECT_EQ(launch(), nullptr) << "the registration has ended, too";
+  EXPECT_EQ(error_.code, EPERM);
 }
 
-TEST_F(LaunchTest, AnInstanceEndsWithItsHost) {
+TEST_F(LaunchTest, AnInstanceEndsWithItsHostAndWithTheDaemon) {
   start();
-  tests::RunningProgram host({PROBE_BINARY, "launch-when-ready", executable_}, place_.environment(), STDOUT_FILENO);
-  ASSERT_EQ(ready({}, "plugin", host.pid()), 0);
-  ASSERT_EQ(host.wait(), 0) << "it has launched, and has ended";
-  const pid_t first = std::stoi(host.output());
-  EXPECT_TRUE(waitFor([&] { return ended(first) && instances()["pids"].size() == 0; }));
-}
-
-TEST_F(LaunchTest, ADeadDaemonLeavesNoInstance) {
-  start();
-  ASSERT_EQ(ready(), 0);
+  ASSERT_EQ(launchElsewhere("host"), 0) << "it has launched, and has ended";
+  EXPECT_TRUE(tests::eventually([&] { return ended(std::stoi(said_)); }));
+  ASSERT_EQ(ready(), "");
   const auto probe = launch();
   ASSERT_NE(probe, nullptr) << error_.describe();
   const std::string first = std::to_string(probe->pid);
   const pid_t plugIn = std::stoi(textOf("/proc/" + first + "/task/" + first + "/children"));
-  daemon_->signal(SIGKILL);
-  EXPECT_TRUE(waitFor([&] { return ended(probe->pid) && ended(plugIn); }));
+  daemon_.process().signal(SIGKILL);
+  EXPECT_TRUE(tests::eventually([&] { return ended(probe->pid) && ended(plugIn); }));
 }
 
 TEST_F(LaunchTest, BusyIsWhatAnInstanceSaysUntilItEndsItOrItself) {
-  start();
-  const Dictionary runtime{{"EXTORA_RUNTIME_DIR", place_.runtime().string()}};
-  ASSERT_EQ(ready(runtime), 0);
-  auto probe = launch();
+  start({{"EXTORA_RUNTIME_DIR", daemon_.runtime().string()}});
+  ASSERT_EQ(ready(), "");
+  const auto probe = launch();
   ASSERT_NE(probe, nullptr) << error_.describe();
-  EXPECT_FALSE(isBusy());
-  ASSERT_EQ(probe->result({{"ask", "begin"}}), 0);
-  EXPECT_TRUE(isBusy());
-  ASSERT_EQ(probe->result({{"ask", "end"}}), 0);
-  EXPECT_FALSE(isBusy());
-  ASSERT_EQ(probe->result({{"ask", "begin"}}), 0);
-  EXPECT_TRUE(isBusy());
+  for (const auto& [ask, busy] : {std::pair{"begin", true}, {"end", false}, {"begin", true}}) {
+    ASSERT_EQ(probe->result({{"ask", ask}}), 0);
+    EXPECT_EQ(isBusy(), busy);
+  }
   ::kill(probe->pid, SIGKILL);
-  EXPECT_TRUE(waitFor([&] { return !isBusy(); }));
-
+  EXPECT_TRUE(tests::eventually([&] { return !isBusy(); }));
   const auto refusal = XTHostServices::beginActivity();
   ASSERT_TRUE(refusal);
   EXPECT_EQ(refusal->code, EPERM) << "a host is no instance";
@@ -362,7 +403,7 @@ TEST_F(LaunchTest, BusyIsWhatAnInstanceSaysUntilItEndsItOrItself) {
 TEST_F(LaunchTest, ExtensionsAreConsumedOnceAndReleasedByWhoConsumedThem) {
   tests::LogCapture log("debug");
   start();
-  const std::string token = issue(bundle_ + "/Info.plist");
+  const std::string token = form()["extensions"]["."].string();
   {
     XTSandboxExtension extension(token);
     EXPECT_EQ(extension.handle(), -1);
@@ -372,9 +413,7 @@ TEST_F(LaunchTest, ExtensionsAreConsumedOnceAndReleasedByWhoConsumedThem) {
     ASSERT_GT(handle, 0);
     extension.consume();
     EXPECT_EQ(extension.handle(), handle) << "once";
-    char head[5] = {};
-    EXPECT_EQ(::read(extension.descriptor(), head, 5), 5);
-    EXPECT_EQ(std::string(head, 5), textOf(bundle_ + "/Info.plist").substr(0, 5));
+    EXPECT_TRUE(UniqueFd(::openat(extension.descriptor(), "Info.plist", O_RDONLY)));
     EXPECT_TRUE(extension.isEqual(XTSandboxExtension(token)));
     EXPECT_FALSE(XTHostServices::release(handle)) << "behind its back";
     extension.expel();
@@ -400,54 +439,45 @@ TEST_F(LaunchTest, ExtensionsAreConsumedOnceAndReleasedByWhoConsumedThem) {
 
 TEST_F(LaunchTest, TokensAreWorthWhatTheDaemonThatIssuedThemSays) {
   start();
-  const auto directory = XTHostServices::consume(issue(bundle_), &error_);
+  const auto tokenOf = [](const Value& form) { return form["extensions"]["."].string(); };
+  const Value first = form();
+  const std::string token = tokenOf(first);
+  const auto directory = XTHostServices::consume(token, &error_);
   ASSERT_TRUE(directory) << error_.describe();
-  const UniqueFd plist(::openat(directory->descriptor.get(), "Info.plist", O_RDONLY));
-  EXPECT_TRUE(plist);
+  EXPECT_TRUE(UniqueFd(::openat(directory->descriptor.get(), "Info.plist", O_RDONLY)));
   EXPECT_LT(::openat(directory->descriptor.get(), "../probe.appex", O_RDONLY), 0);
   EXPECT_LT(::openat(directory->descriptor.get(), "plugin", O_RDWR), 0);
-
-  const auto service = [&](const char* extensionClass) {
-    return xtd_->send({{"ask", "issue-service"}, {"class", extensionClass}, {"name", kIdentifier}})["token"].string();
-  };
-  const auto consumed = XTHostServices::consume(service("com.orvane.extora.plugin-service"), &error_);
+  const auto consumed = XTHostServices::consume(first["service-extension"].string(), &error_);
   ASSERT_TRUE(consumed) << error_.describe();
   EXPECT_FALSE(consumed->descriptor);
-  EXPECT_FALSE(XTHostServices::consume(service("com.example.other"), &error_));
-  EXPECT_EQ(error_.code, EACCES) << "of a class that nobody serves";
 
   // Handles of other processes are none of this one's business.
-  tests::Client other(place_.runtime(), platform::kHostServices);
-  EXPECT_EQ(other.send({{"operation", "release"}, {"handle", consumed->handle + 1}})["errno"].exactUnsigned(),
-            static_cast<std::uint64_t>(EINVAL));
-  EXPECT_EQ(other.send({{"operation", "conquer"}})["errno"].exactUnsigned(), static_cast<std::uint64_t>(EINVAL));
-  EXPECT_EQ(other.send({{"operation", "release"}, {"handle", consumed->handle}}).size(), 0U) << "of the same process";
+  tests::Client other(daemon_.runtime(), platform::kHostServices);
+  const auto errnoOf = [&](const Dictionary& request) { return other.send(request)["errno"].exactUnsigned(); };
+  EXPECT_EQ(errnoOf({{"operation", "release"}, {"handle", consumed->handle + 1}}), std::uint64_t{EINVAL});
+  EXPECT_EQ(errnoOf({{"operation", "conquer"}}), std::uint64_t{EINVAL});
+  EXPECT_EQ(errnoOf({{"operation", "release"}, {"handle", consumed->handle}}), 0U) << "of the same process";
 
-  const std::string place = bundle_ + "/Info.plist";
-  const std::string stale = issue(place);
-  fs::rename(place, place + ".old");
-  fs::copy_file(place + ".old", place);
-  EXPECT_FALSE(XTHostServices::consume(stale, &error_));
-  EXPECT_EQ(error_.code, ESTALE);
-  const std::string old = issue(place);
-  daemon_->signal(SIGTERM);
-  EXPECT_EQ(daemon_->wait(), 0);
-  start();
-  EXPECT_FALSE(XTHostServices::consume(old, &error_));
-  EXPECT_EQ(error_.code, EACCES) << "after a restart";
-  daemon_->signal(SIGTERM);
-  EXPECT_EQ(daemon_->wait(), 0);
+  install({}, "com.example.point");
+  EXPECT_FALSE(XTHostServices::consume(token, &error_));
+  EXPECT_EQ(error_.code, ESTALE) << "its bundle has been replaced";
+  ASSERT_TRUE(tests::eventually([&] { return form()["uuid"] != first["uuid"]; }));
+  const std::string old = tokenOf(form());
+  EXPECT_EQ(daemon_.stop(), 0);
   EXPECT_FALSE(XTHostServices::consume(old, &error_));
   EXPECT_EQ(error_.code, ENOTCONN) << "nobody serves";
+  daemon_.start();
+  EXPECT_FALSE(XTHostServices::consume(old, &error_));
+  EXPECT_EQ(error_.code, EACCES) << "after a restart";
 }
 
 TEST_F(LaunchTest, ASecondDaemonInOneRuntimeDirectoryGoesOnWithoutLaunches) {
   start();
-  auto environment = place_.environment();
-  environment["EXTORA_STATE_DIR"] = place_.root() / "other-state";
-  tests::RunningProgram second({DAEMON_BINARY}, environment, STDERR_FILENO);
+  auto environment = daemon_.environment();
+  environment["EXTORA_STATE_DIR"] = daemon_.root() / "other-state";
+  tests::RunningProgram second({XTD_BINARY, "-S", "com.example.second"}, environment, STDERR_FILENO);
   EXPECT_TRUE(second.waitForOutput("com.orvane.platform is served already"));
-  ASSERT_EQ(ready(), 0);
+  ASSERT_EQ(ready(), "");
   EXPECT_NE(launch(), nullptr) << error_.describe();
 }
 
