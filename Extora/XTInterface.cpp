@@ -58,10 +58,10 @@ std::optional<Error> applyType(InterfaceDescription& interface, const std::strin
 }  // namespace
 
 std::optional<Error> applyInterfaceSpec(InterfaceDescription& interface, const std::string& operation,
-                                        const std::string& specification) {
-  for (const std::string& entry : split(specification, ',')) {
+                                        const std::string& clauses) {
+  for (const std::string& entry : split(clauses, ',')) {
     const auto parts = split(entry, ':');
-    if (parts.size() != 3) return makeError(XTErrorInterface, specification);
+    if (parts.size() != 3) return makeError(XTErrorInterface, clauses);
     if (parts[0] != "request" && parts[0] != "reply") return makeError(XTErrorInterface, parts[0]);
     const auto side = parts[0] == "reply" ? InterfaceDescription::Side::Reply : InterfaceDescription::Side::Request;
     if (auto error = applyType(interface, operation, side, indexOf(parts[1]), parts[2])) return error;
@@ -111,10 +111,10 @@ std::shared_ptr<InterfaceDescription> defineInterface(
     platform::setError(error, makeErrorWithFormat(XTErrorConfiguration, "the interface {} exists already", name));
     return nullptr;
   }
-  for (const auto& [operation, specification] : operations) {
+  for (const auto& [operation, clauses] : operations) {
     made->addOperation(operation);
-    if (specification.empty()) continue;
-    if (auto wrong = applyInterfaceSpec(*made, operation, specification)) {
+    if (clauses.empty()) continue;
+    if (auto wrong = applyInterfaceSpec(*made, operation, clauses)) {
       platform::setError(error, std::move(*wrong));
       return nullptr;
     }

@@ -22,7 +22,7 @@ namespace extora {
 /// Nothing on success; else an error of code XTErrorInterface that describes the wrong part. Entries before it stay
 /// applied.
 [[nodiscard]] std::optional<Error> applyInterfaceSpec(platform::InterfaceDescription& interface,
-                                                      const std::string& operation, const std::string& specification);
+                                                      const std::string& operation, const std::string& clauses);
 
 /// The interface that is registered under the name (platform::InterfaceRegistry); null, a line in the log and an error
 /// of code XTErrorConfiguration when there is none.

@@ -7,18 +7,15 @@
 #include <stdlib.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
-#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <fstream>
-#include <functional>
 #include <iterator>
-#include <vector>
 
 #include "Extora/XTDaemonClient.h"
+#include "bench/Measure.h"
 #include "bench/RawEcho.h"
 #include "platform/ipc/IpcCodec.h"
 #include "platform/ipc/IpcFrame.h"
@@ -28,30 +25,11 @@
 
 namespace {
 
+using bench::measure;
+using bench::Sample;
 using extora::XTDaemonClient;
 using platform::Dictionary;
 using platform::Value;
-using Clock = std::chrono::steady_clock;
-
-struct Sample {
-  double median;  // microseconds
-  double p99;
-};
-
-// Runs `work` until 2000 times or a second have passed, after a tenth of that to warm up.
-Sample measure(const std::function<void()>& work) {
-  constexpr int kTimes = 2000;
-  std::vector<double> times;
-  const auto start = Clock::now();
-  for (int i = -kTimes / 10; i < kTimes && Clock::now() - start < std::chrono::seconds(1); ++i) {
-    const auto before = Clock::now();
-    work();
-    const std::chrono::duration<double, std::micro> time = Clock::now() - before;
-    if (i >= 0 || Clock::now() - start > std::chrono::milliseconds(100)) times.push_back(time.count());
-  }
-  std::sort(times.begin(), times.end());
-  return {times[times.size() / 2], times[times.size() * 99 / 100]};
-}
 
 // One request through the client library, synchronously; its reply body.
 Value ask(XTDaemonClient& client, const Dictionary& request) {

@@ -18,7 +18,7 @@
 #include "Extora/XTPlugInConnection.h"
 #include "Extora/XTPlugInCore.h"
 #include "Extora/XTSandboxExtension.h"
-#include "EditingInterface.h"
+#include "examples/EditingInterface.h"
 
 using extora::Error;
 using extora::XTDaemonClient;

@@ -3,7 +3,7 @@
 #include <future>
 
 #include "Extora/XTPlugInConnection.h"
-#include "EditingInterface.h"
+#include "examples/EditingInterface.h"
 
 int main() {
   const platform::SerialQueue queue("plug-in");

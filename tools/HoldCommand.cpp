@@ -22,7 +22,6 @@ extern char** environ;
 
 namespace tools {
 
-using extora::XTDaemonClient;
 using platform::UniqueFd;
 using platform::Uuid;
 using platform::Value;

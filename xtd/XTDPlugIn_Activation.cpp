@@ -32,7 +32,7 @@ std::string_view XTDPlugIn::sandboxProfile() const {
 
 std::optional<Error> XTDPlugIn::enableForClient(XTDIpcClient& client, const Value& environment) const {
   Dictionary variables(environment);
-  const std::string versionText = version().value_or("");
+  const std::string versionText = version().value_or("(null)");
   if (const auto container = dataContainerURL()) {
     variables.set("HOME", container->path());
     variables.set("HBFIXED_USER_HOME", container->path());

@@ -24,9 +24,9 @@ foreach(text ${texts})
   endif()
 endforeach()
 
-file(COPY ${CMAKE_CURRENT_LIST_DIR}/../../../examples/ DESTINATION ${WORK_DIR}/examples FILES_MATCHING PATTERN "*.h" PATTERN "*.cpp")
+file(COPY ${CMAKE_CURRENT_LIST_DIR}/../../../examples/ DESTINATION ${WORK_DIR}/tree/examples FILES_MATCHING PATTERN "*.h" PATTERN "*.cpp")
 run(${CMAKE_COMMAND} -S ${CMAKE_CURRENT_LIST_DIR} -B ${WORK_DIR}/build -G ${GENERATOR}
-    -DEXAMPLES=${WORK_DIR}/examples -DCMAKE_PREFIX_PATH=${root} -DCMAKE_CXX_COMPILER=${COMPILER} -DCMAKE_CXX_FLAGS=${FLAGS})
+    -DEXAMPLES=${WORK_DIR}/tree -DCMAKE_PREFIX_PATH=${root} -DCMAKE_CXX_COMPILER=${COMPILER} -DCMAKE_CXX_FLAGS=${FLAGS})
 run(${CMAKE_COMMAND} --build ${WORK_DIR}/build)
 foreach(program consumer consumer_pc)
   run(${WORK_DIR}/build/${program})
