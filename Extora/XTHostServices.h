@@ -27,7 +27,7 @@ class XTHostServices {
   /// A sandbox extension that has been consumed.
   struct Consumed {
     std::int64_t handle = -1;  ///< for release
-    /// Of a file token the opened file, or for a directory one that is good for openat(); empty for a service token.
+    /// Of a file token the file or directory, opened for reading; empty for a service token.
     platform::UniqueFd descriptor;
   };
 

@@ -140,10 +140,11 @@ UniqueFd openGrantedPlace(const SandboxGrant& grant, int* errorNumber) {
     *errorNumber = ESTALE;
     return {};
   }
-  if (place->isDirectory) return tree;
-  UniqueFd file(::open(fmt::format("/proc/self/fd/{}", tree.get()).c_str(), O_RDONLY | O_CLOEXEC));
-  if (!file) *errorNumber = errno;
-  return file;
+  // Opened anew for reading: of the clone's own descriptor nobody could list the directory. What is opened keeps the
+  // clone alive.
+  UniqueFd opened(::open(fmt::format("/proc/self/fd/{}", tree.get()).c_str(), O_RDONLY | O_CLOEXEC));
+  if (!opened) *errorNumber = errno;
+  return opened;
 }
 
 }  // namespace platform

@@ -6,9 +6,9 @@
 
 namespace platform {
 
-/// What is handed to whoever consumes the token: for a file the opened file, for a directory a detached clone of its
-/// mount, from which nothing above it can be reached. Either lies on a mount of its own that is read-only, so that who
-/// has the descriptor cannot open it again for writing. Nothing and an error number: ESTALE when the place holds
+/// What is handed to whoever consumes the token: the file or directory, opened for reading on a detached clone of its
+/// mount, from which nothing above it can be reached. That mount is read-only, so that who has the descriptor cannot
+/// open it again for writing. Nothing and an error number: ESTALE when the place holds
 /// another file by now, or none; otherwise what the system says.
 [[nodiscard]] UniqueFd openGrantedPlace(const SandboxGrant& grant, int* errorNumber);
 

@@ -1,3 +1,4 @@
+#include <dirent.h>
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
@@ -57,6 +58,8 @@ class SandboxTokenTest : public testing::Test {
   void expectReadOnlyView(int tree) {
     const UniqueFd file(::openat(tree, "images/cat", O_RDONLY));
     EXPECT_EQ(readAll(file.get()), "miaow");
+    DIR* const listing = ::fdopendir(::dup(tree));
+    EXPECT_TRUE(listing != nullptr && ::closedir(listing) == 0) << "it can be listed";
     EXPECT_LT(::openat(tree, "images/cat", O_RDWR), 0);
     EXPECT_EQ(errno, EROFS);
     EXPECT_LT(::openat(tree, "images/new", O_WRONLY | O_CREAT, 0600), 0);
