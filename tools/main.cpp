@@ -22,6 +22,7 @@
 #include "tools/ReleaseCommand.h"
 #include "tools/RunCommand.h"
 #include "tools/WatchCommand.h"
+#include "tools/WhyCommand.h"
 
 namespace {
 
@@ -51,6 +52,7 @@ int run(int argc, char** argv) {
   std::vector<std::unique_ptr<tools::Command>> commands;
   commands.push_back(std::make_unique<tools::MatchCommand>());
   commands.push_back(std::make_unique<tools::FindCommand>());
+  commands.push_back(std::make_unique<tools::WhyCommand>());
   commands.push_back(std::make_unique<tools::WatchCommand>());
   commands.push_back(std::make_unique<tools::ElectCommand>());
   commands.push_back(std::make_unique<tools::ElectionsCommand>());

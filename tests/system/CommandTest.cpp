@@ -129,6 +129,45 @@ TEST_F(CommandTest, PlugInsAreAddedByAnybodyAndRemovedByManagers) {
             "1:xtctl: the daemon refused: invalid plugin path: " + path + ".none (code 9)\n");
 }
 
+TEST_F(CommandTest, WhyNamesTheConditionThatMakesTheDifference) {
+  auto dedicated = samplePlugIn("com.example.dedicated");
+  tests::setPlugInKey(dedicated, "Dedicated", true);
+  auto demanding = samplePlugIn("com.example.demanding");
+  tests::setPlugInKey(demanding, std::string(XTHostEntitlementInfoKey), "com.example.key");
+  const auto newer = samplePlugIn("com.example.x", {{XTVersionAttribute, "1.10"}});
+  const auto a = tests::writeBundle(
+      daemon_.applications(), sampleApplication("com.example.a", {dedicated, demanding, newer, samplePlugIn("c.y")}));
+  const auto b = tests::writeBundle(
+      daemon_.applications(),
+      sampleApplication("com.example.b", {samplePlugIn("com.example.x", {{XTVersionAttribute, "1.9"}})}));
+  daemon_.start();
+  const auto why = [&](const std::string& plugIn, std::vector<std::string> rules = {}) {
+    rules.insert(rules.begin(), {"why", plugIn});
+    return run(rules);
+  };
+  EXPECT_EQ(why("com.example.x"), "0:com.example.x 1.10: offered\n");
+  const std::string old = b + "/PlugIns/x.appex";
+  EXPECT_EQ(why(old), "1:com.example.x 1.9: not offered\n  com.example.x 1.10 at " + a +
+                          "/PlugIns/x.appex is offered instead: it is newer\n");
+  EXPECT_EQ(why(old, {"-r", "HXExtensionVersion=<1.10"}), "0:com.example.x 1.9: offered\n");
+  EXPECT_EQ(why("c.y", {"-r", "HXExtensionVersion=1.0", "-r", "HXUserElection=1"}),
+            "1:c.y 1.0: not offered\n  the rule HXUserElection = 1 does not hold; its election is none\n");
+  EXPECT_EQ(why(a + "/PlugIns/dedicated.appex"),
+            "1:com.example.dedicated 1.0: not offered\n  it is dedicated: only hosts in " + a + " are offered it\n");
+  EXPECT_EQ(why(a + "/PlugIns/demanding.appex"),
+            "1:com.example.demanding 1.0: not offered\n  the host does not have the \"com.example.key\" entitlement\n");
+  tests::writePropertyList(
+      daemon_.config() / "preferences" / "com.orvane.extora.userprefs.plist",
+      platform::Dictionary{
+          {XTExclusionsPreferenceKey, platform::Array{platform::Dictionary{{XTIdentifierAttribute, "c.y"}}}}});
+  EXPECT_EQ(why(a + "/PlugIns/y.appex"),
+            "1:c.y 1.0: not offered\n  the user has excluded it: see `xtctl exclusions`\n");
+  auto client = daemon_.connect();
+  (void)client.request("lock", {{"paths", platform::Array{b}}});
+  EXPECT_EQ(why(old), "1:com.example.x 1.9: not offered\n  the plug-in is on hold\n");
+  EXPECT_EQ(tests::countOf(why(b + "/PlugIns"), "`xtctl lint` says what is wrong with a bundle"), 1U);
+}
+
 TEST_F(CommandTest, ExclusionsAreShownWithWhatIsWrongWithThem) {
   const auto exclusions = [&](const platform::Value& value) {
     tests::writePropertyList(daemon_.config() / "preferences" / "com.orvane.extora.userprefs.plist",
