@@ -15,7 +15,6 @@
 #include "platform/queue/Mutex.h"
 #include "platform/registry/BundleRegistry.h"
 #include "tests/support/LogCapture.h"
-#include "tests/support/PrintDescribed.h"
 #include "tests/support/SampleBundles.h"
 #include "tests/support/TestPlatform.h"
 

@@ -92,6 +92,44 @@ TEST_F(AnnotationTest, AnElectionIsAnnouncedAndOutlivesDaemonAndPlugIn) {
   EXPECT_TRUE(again[0]["annotations"] == both) << "of a plug-in that was installed again";
 }
 
+TEST_F(AnnotationTest, OnlyWholeRequestsAreAnnouncedAndAFailureKeepsWhatCameBeforeIt) {
+  auto client = daemon_.connect();
+  const std::string change(XTNotifyAnnotationChange);
+  const auto before = daemon_.notificationCount(change);
+  const platform::Uuid unknown = *platform::Uuid::parse("FFFFFFFF-FFFF-4FFF-BFFF-FFFFFFFFFFFF");  // after all others
+  const auto both = [&](const char* type, const Value& annotations) {
+    return failureOf(client.request(type, {{"annotations", annotations}, {"uuids", Array{uuid(0), uuid(1), unknown}}}));
+  };
+  const std::string whole = "4 invalid request format (bad annotations dictionary)";
+  const Dictionary good{{"k", 1}};
+  const auto bulk = [&](const std::string& key, const Value& value) {
+    return both("bulk-annotate", Dictionary{{uuid(2).text(), good}, {key, value}});
+  };
+  for (const Value& wrong : {Value(), Value(Array()), Value("x")}) {
+    EXPECT_EQ(both("annotate", wrong), whole);
+    EXPECT_EQ(both("bulk-annotate", wrong), whole);
+  }
+  EXPECT_EQ(both("annotate", Dictionary{{"election", "1"}, {"extension", 1}}),
+            "4 invalid request format (annotation election)");
+  EXPECT_EQ(both("annotate", Dictionary{{"election", 1}, {"extension", 1}}),
+            "4 invalid request format (annotation extension)");
+  EXPECT_EQ(both("annotate", Dictionary{{"own", 1}}), "") << "nothing to note: nothing is looked up";
+  EXPECT_TRUE(stored(0) == Value(Dictionary()));
+  EXPECT_EQ(both("annotate", Dictionary{{"election", 2}, {"own", 1}}), "4 no such plugin (uuid not found)");
+  for (const int i : {0, 1}) EXPECT_TRUE(stored(i) == Value(Dictionary{{"election", 2}}));
+  EXPECT_EQ(bulk("~", 1), "18 annotations values must be dictionaries");
+  EXPECT_EQ(bulk("~", good), "18 invalid plug-in UUID value");
+  EXPECT_EQ(bulk(unknown.text(), good), "2 no plug-in with the requested uuid");
+  EXPECT_TRUE(stored(2) == Value(Dictionary{{"extension", good}}));
+  EXPECT_EQ(daemon_.notificationCount(change), before);
+  EXPECT_EQ(failureOf(client.request("bulk-annotate", {{"annotations", Dictionary()}})), "");
+  EXPECT_EQ(daemon_.notificationCount(change), before + 1) << "of an empty list too";
+  const std::string who = "com.example.p0(" + uuid(0).text() + ") ";
+  EXPECT_TRUE(daemon_.waitForLog("plug-in " + who + "annotation change: {election: 2}\n"));
+  EXPECT_TRUE(daemon_.waitForLog("plug-in " + who + "election := 2\n"));
+  EXPECT_TRUE(daemon_.waitForLog(" bulk plug-in com.example.p2(" + uuid(2).text() + ") annotation change: {k: 1}\n"));
+}
+
 // A stream of annotations, each a number one higher than the last, to one plug-in after the other; the daemon is killed
 // at any moment. Afterwards the numbers are those of one moment not before the last acknowledged one.
 TEST_F(AnnotationTest, AKilledDaemonKeepsWhatItAcknowledgedAndMixesNothing) {

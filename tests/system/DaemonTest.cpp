@@ -4,10 +4,8 @@
 #include <sys/socket.h>
 
 #include <fstream>
-#include <sstream>
 
 #include "Extora/XTVocabulary.h"
-#include "platform/ipc/IpcCodec.h"
 #include "platform/ipc/IpcFrame.h"
 #include "tests/support/Daemon.h"
 #include "tests/support/SampleBundles.h"
@@ -93,11 +91,16 @@ TEST_F(DaemonTest, AServerThatCannotBeBuiltIsAnError) {
 TEST_F(DaemonTest, RefusesWhatItDoesNotServe) {
   daemon_.start();
   auto client = daemon_.connect();
-  EXPECT_EQ(failureOf(client.request("find", {{"version", std::uint64_t{4}}})),
-            "7 unsupported protocol version 4 (current 3)");
-  EXPECT_EQ(failureOf(client.send({{"request", "find"}})), "7 unsupported protocol version 0 (current 3)");
-  EXPECT_EQ(failureOf(client.send({{"version", std::uint64_t{2}}})), "4 invalid request format (missing type)");
-  EXPECT_EQ(failureOf(client.request("Match")), "4 unrecognized request");
+  for (const Value& version : {Value(), Value(1U), Value(4U), Value(3), Value(std::uint64_t{1} << 32), Value("3")}) {
+    EXPECT_EQ(failureOf(client.send({{"request", "find"}, {"version", version}})),
+              "7 unsupported protocol version " + std::to_string(version.exactUnsigned()) + " (current 3)");
+  }
+  const Value two = 2U;
+  EXPECT_EQ(failureOf(client.send({{"version", two}})), "4 invalid request format (missing type)");
+  EXPECT_EQ(failureOf(client.send({{"version", two}, {"request", 7U}})), "4 invalid request format (missing type)");
+  EXPECT_EQ(failureOf(client.send({{"version", two}, {"request", "find"}})), "15 Cannot locate PlugIn");
+  EXPECT_TRUE(client.send({{"version", two}, {"request", "match"}}) == Value(Dictionary())) << "no encoding for forms";
+  for (const char* type : {"Match", "match ", ""}) EXPECT_EQ(failureOf(client.request(type)), "4 unrecognized request");
   EXPECT_EQ(failureOf(client.request("match", {{"rules", "x"}})), "4 invalid request format (bad rules dictionary)");
 }
 

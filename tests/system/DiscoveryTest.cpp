@@ -57,6 +57,12 @@ TEST_F(DiscoveryTest, AFormTellsAllAboutAPlugIn) {
   EXPECT_EQ(form["bundleInfo"]["HBBundleIdentifier"].string(), "com.example.filter");
   EXPECT_TRUE(platform::Uuid::parse(form["uuid"].string()));
   EXPECT_GT(form["lastmodified"].exactSigned(), 1'600'000'000);
+  const std::string& uuid = form["uuid"].string();
+  EXPECT_TRUE(
+      daemon_.waitForLog("INFO ops: Candidate plugin count: 1, info: [\"com.example.filter(2.5) " + uuid + "\"]\n"));
+  EXPECT_TRUE(daemon_.waitForLog("INFO ops: Resulting plugin count: 1, UUIDs: [\"" + uuid + "\"]\n"));
+  EXPECT_EQ(match(0, {{"x", "y"}}), Texts());
+  EXPECT_TRUE(daemon_.waitForLog("INFO ops: Resulting plugin count: 0\n"));
 }
 
 TEST_F(DiscoveryTest, TheNewestVersionIsOfferedUnlessMoreAreAskedFor) {
@@ -138,18 +144,6 @@ TEST_F(DiscoveryTest, AManagerMayLookAtEverythingThatIsNotExcluded) {
 
   setExclusions("no list");
   EXPECT_EQ(match(), Texts{"com.example.plain 1.0"}) << "exclusions are read afresh";
-}
-
-TEST_F(DiscoveryTest, FollowsInstallsAndUninstalls) {
-  daemon_.start();
-  EXPECT_EQ(match(), Texts());
-  const auto application =
-      tests::installBundle(daemon_.applications(), sampleApplication("com.example.a", {samplePlugIn("com.example.x")}));
-  ASSERT_TRUE(daemon_.waitForLog("DEFAULT ops: plug-in INSTALLED:com.example.x com.example.x(1) "));
-  EXPECT_EQ(match(), Texts{"com.example.x 1.0"});
-  tests::removeBundle(application);
-  ASSERT_TRUE(daemon_.waitForLog("DEFAULT ops: plug-in UNINSTALLED:com.example.x com.example.x(1) "));
-  EXPECT_EQ(match(), Texts());
 }
 
 }  // namespace

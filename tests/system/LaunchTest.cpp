@@ -16,7 +16,6 @@
 #include <filesystem>
 #include <fstream>
 #include <set>
-#include <thread>
 
 #include "Extora/XTHostServices.h"
 #include "Extora/XTProtocol.h"

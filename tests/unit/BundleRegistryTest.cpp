@@ -1,6 +1,5 @@
 #include "platform/registry/BundleRegistry.h"
 
-#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
@@ -316,28 +315,6 @@ TEST_F(BundleRegistryTest, RefusesToRegisterWhatIsNoTrustedPlugIn) {
   EXPECT_TRUE(names().empty()) << "nothing of it is remembered";
   EXPECT_EQ(registry_->registryRegisterPlugin(Url::file(linked)), std::nullopt);
   EXPECT_EQ(named("filter")->bundleURL->path(), filter) << "paths of records are canonical";
-}
-
-TEST_F(BundleRegistryTest, AnUnregisteredPlugInOfAFolderStaysAwayUntilItIsRegisteredOrReplaced) {
-  const SampleBundle mail = sampleApplication("mail", {samplePlugIn("filter"), samplePlugIn("other")});
-  const Url filter = Url::file(writeBundle(apps_, mail) + "/PlugIns/filter.appex");
-  start();
-  const auto uuid = named("filter")->plugInUUID;
-  const auto kept = named("other")->plugInUUID;
-  EXPECT_EQ(registry_->registryUnregisterPlugin(filter), std::nullopt);
-  EXPECT_EQ(names(), Names{"other"});
-  start();
-  EXPECT_EQ(names(), Names{"other"});
-  EXPECT_EQ(registry_->registryRegisterPlugin(filter), std::nullopt);
-  EXPECT_EQ(names(), (Names{"filter", "other"}));
-  EXPECT_NE(named("filter")->plugInUUID, uuid);
-  EXPECT_EQ(named("other")->plugInUUID, kept);
-  EXPECT_EQ(observer_->take(), Names{"+filter"});
-
-  EXPECT_EQ(registry_->registryUnregisterPlugin(filter), std::nullopt);
-  installBundle(apps_, mail);
-  start();
-  EXPECT_EQ(names(), (Names{"filter", "other"})) << "it is another bundle now";
 }
 
 TEST_F(BundleRegistryTest, FoldersMayBeMissingLinkedOrNamedTwice) {

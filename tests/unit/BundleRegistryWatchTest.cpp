@@ -1,9 +1,7 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <stdio.h>
-#include <unistd.h>
 
-#include <fstream>
 #include <thread>
 
 #include "platform/registry/BundleRegistry.h"
@@ -35,34 +33,6 @@ class BundleRegistryWatchTest : public tests::RegistryFixture {
   }
   std::vector<std::string> lines_;
 };
-
-TEST_F(BundleRegistryWatchTest, FollowsInstallsRemovalsAndReplacements) {
-  start();
-  const SampleBundle mail = sampleApplication("mail", {samplePlugIn("filter"), samplePlugIn("other")});
-  const std::string path = installBundle(apps_, mail);
-  ASSERT_TRUE(waitForNames({"filter", "other"}));
-  const PlugInRecord old = named("filter");
-  const auto knowledge = registry_->registryKnowledgeUUID();
-  ASSERT_TRUE(waitFor([&] { return options_.notifications->counter(kRegistryChangeNotification) == 1U; }));
-  EXPECT_EQ(observer_->take(), Names{"+filter other"});
-
-  installBundle(apps_, mail);
-  ASSERT_TRUE(waitFor([&] {
-    const PlugInRecord now = named("filter");
-    return now != nullptr && now->plugInUUID != old->plugInUUID;
-  }));
-  EXPECT_EQ(registry_->registryPlugInByUUID(*old->plugInUUID), nullptr);
-  EXPECT_NE(registry_->registryKnowledgeUUID(), knowledge);
-  EXPECT_EQ(named("filter")->dataContainerURL, old->dataContainerURL);
-
-  removeBundle(path);
-  writeBundle(directory_.path("plugins"), samplePlugIn("lone"));
-  ASSERT_TRUE(waitForNames({"lone"}));
-  Names told = observer_->take();
-  // The replacement is two changes or one, but always uninstalls before it installs.
-  std::erase(told, "+lone");
-  EXPECT_EQ(told, (Names{"-filter other", "+filter other", "-filter other"}));
-}
 
 TEST_F(BundleRegistryWatchTest, AnExchangeInOneStepIsAReplacementAlsoWhenTheFilesAreTheSame) {
   const SampleBundle mail = sampleApplication("mail", {samplePlugIn("filter")});
@@ -110,78 +80,6 @@ TEST_F(BundleRegistryWatchTest, ABundleThatIsCopiedInPlaceIsCompleteInTheEnd) {
   locale_->changeTo("de");
   ASSERT_TRUE(waitFor([&] { return named("filter")->localizedName == "Deutsch"; }));
   EXPECT_EQ(linesWith("left out " + path + ": no Info.plist"), 1U);
-}
-
-TEST_F(BundleRegistryWatchTest, ABrokenBundleIsLookedAtAgainWhenItChanges) {
-  const std::string path =
-      writeBundle(apps_, sampleApplication("mail", {samplePlugIn("good"), samplePlugIn("filter")}));
-  const std::string info = path + "/PlugIns/filter.appex/Info.plist";
-  const Value content = samplePlugIn("filter").info;
-  std::ofstream(info) << "<plist>";
-  start();
-  EXPECT_EQ(names(), Names{"good"});
-  EXPECT_EQ(linesWith("left out " + path + "/PlugIns/filter.appex: Info.plist: "), 1U);
-  const auto good = named("good")->plugInUUID;
-  tests::writePropertyList(info, content);
-  ASSERT_TRUE(waitForNames({"filter", "good"}));
-  EXPECT_EQ(named("good")->plugInUUID, good);
-
-  fs::create_directory_symlink(path, apps_ + "/linked.app");
-  fs::create_directory_symlink(apps_, apps_ + "/mail.app/PlugIns/cycle");
-  ASSERT_TRUE(waitFor([&] { return linesWith("left out " + apps_ + "/linked.app: it is a link") == 1; }));
-  EXPECT_EQ(names(), (Names{"filter", "good"}));
-  EXPECT_EQ(observer_->take(), Names{"+filter"});
-}
-
-TEST_F(BundleRegistryWatchTest, ABurstIsFollowedWholeAlsoWhenEventsAreLost) {
-  start();
-  Names all;
-  for (int i = 100; i < 150; ++i) {
-    const std::string identifier = "plugin" + std::to_string(i);
-    installBundle(apps_, sampleApplication("app" + std::to_string(i), {samplePlugIn(identifier)}));
-    all.push_back(identifier);
-  }
-  ASSERT_TRUE(waitForNames(all));
-
-  // More events than the kernel keeps, while nobody reads them.
-  std::size_t limit = 0;
-  std::ifstream("/proc/sys/fs/inotify/max_queued_events") >> limit;
-  ASSERT_GT(limit, 0U);
-  const std::string one = apps_ + "/x";
-  const std::string other = apps_ + "/y";
-  fs::create_directory(one);
-  for (std::size_t i = 0; i < limit / 4 + 10; ++i) {
-    fs::rename(one, other);
-    fs::rename(other, one);
-  }
-  installBundle(apps_, sampleApplication("late", {samplePlugIn("late")}));
-  removeBundle(apps_ + "/app100.app");
-  all.erase(all.begin());
-  all.insert(all.begin(), "late");
-  ASSERT_TRUE(waitForNames(all));
-}
-
-TEST_F(BundleRegistryWatchTest, AFolderMayComeLaterBeMovedAwayOrBeMadeAnew) {
-  const std::string top = directory_.path("top");
-  const std::string folder = top + "/middle/apps";
-  options_.directories.applications = {folder};
-  start();
-  fs::create_directories(folder);
-  writeBundle(folder, sampleApplication("mail", {samplePlugIn("filter")}));
-  ASSERT_TRUE(waitForNames({"filter"}));
-  fs::rename(top, top + ".away");
-  ASSERT_TRUE(waitForNames({}));
-  fs::create_directories(folder);
-  installBundle(folder, sampleApplication("clock", {samplePlugIn("hands")}));
-  ASSERT_TRUE(waitForNames({"hands"}));
-  fs::rename(folder, folder + ".away");
-  fs::rename(top + ".away/middle/apps", folder);
-  ASSERT_TRUE(waitForNames({"filter"}));
-  fs::remove_all(folder);
-  ASSERT_TRUE(waitForNames({}));
-  fs::create_directory(folder);
-  installBundle(folder, sampleApplication("clock", {samplePlugIn("hands")}));
-  ASSERT_TRUE(waitForNames({"hands"}));
 }
 
 TEST_F(BundleRegistryWatchTest, WithoutEnoughWatchesTheFoldersArePolled) {

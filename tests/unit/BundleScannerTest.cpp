@@ -45,45 +45,6 @@ class BundleScannerTest : public ::testing::Test {
 
 using Reasons = std::vector<std::string>;
 
-TEST_F(BundleScannerTest, ReadsAnApplicationWithItsPlugInsOfBothStyles) {
-  SampleBundle filter = samplePlugIn("com.example.mail.filter");
-  filter.entitlements = Dictionary{{"right", true}};
-  filter.tables["de/InfoPlist"] = {{"HBBundleDisplayName", "Filter (de)"}, {"HBBundleName", "F"}};
-  filter.tables["fr/Localizable"] = {{"key", "texte"}};
-  SampleBundle old{
-      "Old.plugin", {{"HBBundleIdentifier", "old"}, {"Extora", Dictionary{{"PrincipalClass", "C"}}}}, {}, {}, {}, {}};
-  const SampleBundle framework{"Shared.framework", {{"HBBundleIdentifier", "shared"}}, {}, {}, {}, {}};
-  const std::string path =
-      tests::writeBundle(directory_.path(), sampleApplication("com.example.mail", {filter, old, framework}));
-  fs::create_directory(path + "/PlugIns/plain folder");
-
-  const ScannedGroup group = scan(path);
-  EXPECT_EQ(reasons(group), Reasons());
-  ASSERT_TRUE(group.found);
-  EXPECT_EQ(group.application->bundleIdentifier(), "com.example.mail");
-  ASSERT_EQ(group.plugIns.size(), 2U);
-  const BundleRegistration& oldStyle = *group.plugIns[0];
-  EXPECT_EQ(oldStyle.plugInDictionary()["PrincipalClass"], Value("C"));
-  EXPECT_EQ(oldStyle.identifier(), "old");
-  const BundleRegistration& newStyle = *group.plugIns[1];
-  EXPECT_EQ(newStyle.path, path + "/PlugIns/filter.appex");
-  EXPECT_EQ(newStyle.info, Value(filter.info));
-  EXPECT_EQ(newStyle.entitlements, filter.entitlements);
-  EXPECT_EQ(newStyle.localizedName({"de_CH", "de"}), "Filter (de)");
-  EXPECT_EQ(newStyle.localizedShortName({"de"}), "F");
-  EXPECT_EQ(newStyle.localizedName({"fr"}), "filter") << "a language without the table has no names";
-
-  // What the store keeps is the same.
-  const RegistrationPtr again = BundleRegistration::decode(newStyle.path, newStyle.encode());
-  ASSERT_NE(again, nullptr);
-  EXPECT_EQ(again->uuid, newStyle.uuid);
-  EXPECT_EQ(again->date, newStyle.date);
-  EXPECT_EQ(again->stamp, newStyle.stamp);
-  EXPECT_EQ(again->info, newStyle.info);
-  EXPECT_EQ(again->entitlements, newStyle.entitlements);
-  EXPECT_EQ(again->localizedName({"de"}), "Filter (de)");
-}
-
 TEST_F(BundleScannerTest, NamesFallBackFromLanguageToLanguageToThePlainOnesToTheDirectory) {
   BundleRegistration bundle;
   bundle.path = "/x/Some.thing.appex";

@@ -145,15 +145,6 @@ TEST_F(CodeSigningTest, AProcessThatHasEndedHasNoEntitlements) {
   EXPECT_EQ(signing_->taskForAuditToken(nullptr), nullptr);
 }
 
-TEST_F(CodeSigningTest, WithoutAnEntitlementsFileThereIsNothingAndNoError) {
-  fs::remove(app_ + "/Entitlements.plist");
-  ASSERT_EQ(::chmod(app_.c_str(), 0777), 0);
-  EXPECT_EQ(askFresh(host_), "nothing");
-  Error error;
-  EXPECT_TRUE(entitlementsOfBundle(app_, &error).isNothing());
-  EXPECT_EQ(error, Error());
-}
-
 TEST_F(CodeSigningTest, AnExecutableInNoBundleHasTheFileBesideIt) {
   write(host_ + ".entitlements", R"(<plist version="1.0"><dict/></plist>)");
   EXPECT_EQ(askFresh(host_), "yes") << "the bundle's count, not the file beside";

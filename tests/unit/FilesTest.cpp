@@ -24,38 +24,6 @@ mode_t modeOf(const std::string& path) {
   return ::lstat(path.c_str(), &status) == 0 ? status.st_mode & 07777U : 0;
 }
 
-// Fails its n-th step with EIO, and takes 3 bytes a write.
-class FaultyFiles : public PosixFiles {
- public:
-  explicit FaultyFiles(int failing) : failing_(failing) {}
-  std::string failed;
-
- protected:
-  int openDirectory(const char* path) override { return fails("openDirectory") ? -1 : PosixFiles::openDirectory(path); }
-  int openTemporary(int directory, const char* name) override {
-    return fails("openTemporary") ? -1 : PosixFiles::openTemporary(directory, name);
-  }
-  ssize_t writeSome(int fd, const std::uint8_t* bytes, std::size_t size) override {
-    return fails("writeSome") ? -1 : PosixFiles::writeSome(fd, bytes, std::min<std::size_t>(size, 3));
-  }
-  int syncFile(int fd) override { return fails("syncFile") ? -1 : PosixFiles::syncFile(fd); }
-  int renameFile(int directory, const char* from, const char* to) override {
-    return fails("renameFile") ? -1 : PosixFiles::renameFile(directory, from, to);
-  }
-  int syncDirectory(int directory) override {
-    return fails("syncDirectory") ? -1 : PosixFiles::syncDirectory(directory);
-  }
-
- private:
-  bool fails(const char* step) {
-    if (--failing_ != 0) return false;
-    failed = step;
-    errno = EIO;
-    return true;
-  }
-  int failing_;
-};
-
 class FilesTest : public testing::Test {
  protected:
   std::string content(const std::string& path) {
@@ -67,26 +35,6 @@ class FilesTest : public testing::Test {
   const std::string path_ = directory_.path("file");
   const std::shared_ptr<Files> files_ = Files::make();
 };
-
-TEST_F(FilesTest, AFailureOfAnyStepLeavesTheOldContentAndNoTemporaryFile) {
-  std::vector<std::string> failed;
-  for (int n = 1; n < 100; ++n) {
-    ASSERT_EQ(files_->writeFileAtomic(path_, bytesOf("old")), std::nullopt);
-    FaultyFiles faulty(n);
-    const auto error = faulty.writeFileAtomic(path_, bytesOf("new content"));
-    EXPECT_EQ(fs::directory_iterator(directory_.path())->path(), path_);
-    EXPECT_EQ(std::distance(fs::directory_iterator(directory_.path()), {}), 1) << faulty.failed;
-    // After the rename there is no way back; the caller learns that it may not last.
-    EXPECT_EQ(content(path_), !error || faulty.failed == "syncDirectory" ? "new content" : "old") << faulty.failed;
-    if (!error) break;
-    EXPECT_EQ(error->domain, "POSIX");
-    EXPECT_EQ(error->code, EIO);
-    EXPECT_NE(error->localizedDescription().find(directory_.path()), std::string::npos) << *error->description;
-    failed.push_back(faulty.failed);
-  }
-  EXPECT_EQ(failed, (std::vector<std::string>{"openDirectory", "openTemporary", "writeSome", "writeSome", "writeSome",
-                                              "writeSome", "syncFile", "renameFile", "syncDirectory"}));
-}
 
 TEST_F(FilesTest, AWriteFollowsNoLinkAndReplacesWhatADeadProcessLeft) {
   const std::string other = directory_.path("other");

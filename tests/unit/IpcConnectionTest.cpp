@@ -7,7 +7,6 @@
 #include <sys/ioctl.h>
 #include <sys/mman.h>
 #include <sys/socket.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <array>
@@ -18,7 +17,6 @@
 #include "platform/ipc/IpcFrame.h"
 #include "platform/ipc/IpcMemoryFile.h"
 #include "platform/ipc/IpcSocketConnection.h"
-#include "platform/queue/Group.h"
 #include "platform/value/InternalInconsistency.h"
 #include "tests/support/Eventually.h"
 #include "tests/support/PrintDescribed.h"
@@ -254,23 +252,6 @@ TEST(IpcConnectionTest, BrokenInputEndsItsConnectionAfterWhatCameBefore) {
     EXPECT_TRUE(service.client->atEnd());
     EXPECT_FALSE(service.connection->isValid());
   }
-}
-
-TEST(IpcConnectionTest, WhatWasCompleteBeforeTheEndOfInputIsServed) {
-  ServiceEnd half(echo);
-  half.client->write(request(1, Dictionary{}) + request(2, Dictionary{}));
-  ::shutdown(half.client->fd(), SHUT_WR);
-  const std::string map = Value(Dictionary{}).describe();
-  EXPECT_EQ(half.events.waitFor(3), (Texts{map, map, "invalid: the peer has gone"}));
-  EXPECT_EQ(half.client->readFrame().header.id, 1U);
-  EXPECT_EQ(half.client->readFrame().header.id, 2U);
-  // A frame cut short is lost with its sender, and nobody's fault.
-  ServiceEnd cut(echo);
-  Bytes frame = request(2, Dictionary{});
-  frame.pop_back();
-  cut.client->write(request(1, Dictionary{}) + frame);
-  cut.client->close();
-  EXPECT_EQ(cut.events.waitFor(2), (Texts{map, "invalid: the peer has gone"}));
 }
 
 TEST(IpcConnectionTest, DescriptorsFromAClientAreClosedAtOnceAndBreakItsConnection) {

@@ -1,4 +1,3 @@
-#include <fmt/format.h>
 #include <gtest/gtest.h>
 #include <linux/sched.h>
 #include <signal.h>
@@ -152,18 +151,6 @@ TEST_F(JobManagerTest, RemovalEndsInstancesAndAnswersOnce) {
   EXPECT_EQ(answer_, JobManager::kNoneOnRecord);
 }
 
-TEST_F(JobManagerTest, StubbornInstanceIsKilledAfterTheGracePeriod) {
-  const std::string ready = directory_.path("ready");
-  const Child host(kIdle);
-  const Child stubborn(fmt::format("trap '' TERM; : >'{}'; while :; do sleep 1; done", ready).c_str());
-  ASSERT_TRUE(runUntil([&] { return std::filesystem::exists(ready); })) << "the trap is set";
-  start(host, stubborn);
-  remove();
-  ASSERT_TRUE(answered(1));
-  EXPECT_EQ(answer_, 0);
-  EXPECT_TRUE(stubborn.ended());
-}
-
 TEST_F(JobManagerTest, ManyRemovalsOfWhatDoesNotEndCostNoThreads) {
   const Child host(kIdle);
   Child stubborn(kIdle);
@@ -177,18 +164,6 @@ TEST_F(JobManagerTest, ManyRemovalsOfWhatDoesNotEndCostNoThreads) {
   EXPECT_LT(std::distance(threads, {}), 50) << "none of them waits in a thread of its own";
   stubborn.end();
   ASSERT_TRUE(answered(kRemovals));
-  EXPECT_EQ(answer_, 0);
-}
-
-TEST_F(JobManagerTest, DeadInstanceLeavesTheRecordAndARegistrationIsEnough) {
-  const Child host(kIdle);
-  {
-    const Child dead("exit 0");
-    start(host, dead);
-    ASSERT_TRUE(runUntil([&] { return jobs_->instances(kIdentifier).empty(); }));
-  }
-  remove();
-  ASSERT_TRUE(answered(1));
   EXPECT_EQ(answer_, 0);
 }
 
@@ -208,29 +183,6 @@ TEST_F(JobManagerTest, RemovalWaitsForWhatIsJustBeingStartedAndKeepsItFromRunnin
   EXPECT_EQ(answer_, 0);
 }
 
-TEST_F(JobManagerTest, RegistrationAndInstancesEndWithTheirHost) {
-  const Child instance(kIdle);
-  Child host(kIdle);
-  start(host, instance);
-  const auto launch = begin(host);
-  ASSERT_TRUE(launch);
-  jobs_->launchFailed(launch->instance);
-  EXPECT_FALSE(begin(instance)) << "only the very host";
-  EXPECT_FALSE(jobs_->beginLaunch(host.identity(), "/bin/true", &refusal_)) << "only the very executable";
-  const pid_t recycled = host.pid();
-  host.end();
-  ASSERT_TRUE(runUntil([&] { return jobs_->instances(kIdentifier).empty(); }));
-  EXPECT_TRUE(instance.ended());
-
-  const Child next(kIdle, recycled);
-  if (next.pid() == recycled) {
-    EXPECT_FALSE(begin(next)) << "a recycled process id";
-  }
-  remove();
-  ASSERT_TRUE(answered(1));
-  EXPECT_EQ(answer_, JobManager::kNoneOnRecord);
-}
-
 TEST_F(JobManagerTest, RecycledProcessIdOfADeadHostStillEndsItsInstances) {
   const Child instance(kIdle);
   Child host(kIdle);
@@ -243,19 +195,6 @@ TEST_F(JobManagerTest, RecycledProcessIdOfADeadHostStillEndsItsInstances) {
   ASSERT_EQ(add(next), 0);
   ASSERT_TRUE(runUntil([&] { return jobs_->instances(kIdentifier).empty(); }));
   EXPECT_TRUE(begin(next));
-}
-
-TEST_F(JobManagerTest, RegistrationEndsWhenTheRegistryDropsOrReplacesTheBundle) {
-  const Child host(kIdle);
-  ASSERT_EQ(add(host), 0);
-  registry_->uninstall(plugIn_, false);
-  EXPECT_FALSE(begin(host));
-  EXPECT_EQ(refusal_, EPERM);
-  EXPECT_EQ(add(host), ENOENT);
-  install();
-  EXPECT_FALSE(begin(host)) << "another plug-in at the same place";
-  ASSERT_EQ(add(host), 0);
-  EXPECT_TRUE(begin(host));
 }
 
 TEST_F(JobManagerTest, RefusesWhatCannotBeLaunched) {

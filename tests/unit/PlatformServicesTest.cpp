@@ -1,6 +1,7 @@
 // The small services that keep files below the instance's directories: preferences, notifications, containers, locale,
 // bundles, and the directories themselves.
 #include <fcntl.h>
+#include <fmt/format.h>
 #include <gtest/gtest.h>
 #include <sys/file.h>
 #include <sys/stat.h>
@@ -17,7 +18,6 @@
 #include "platform/notify/Notifications.h"
 #include "platform/preferences/Preferences.h"
 #include "platform/queue/MainRunLoop.h"
-#include "tests/support/LogCapture.h"
 #include "tests/support/TestPlatform.h"
 
 namespace platform {
@@ -88,20 +88,6 @@ TEST_F(PlatformServicesTest, PreferencesNeverAnswerWhatAFileHeldBefore) {
   EXPECT_TRUE(read().isNothing());
   write(directories_.config + "/outside.plist", propertyList("<dict><key>key</key><true/></dict>"));
   EXPECT_TRUE(preferences->preferenceValue("../outside", "key").isNothing());
-}
-
-TEST_F(PlatformServicesTest, DamagedPreferencesAreSaidOncePerChange) {
-  tests::LogCapture log;
-  fs::create_directories(directories_.config + "/preferences");
-  const std::string path = directories_.config + "/preferences/com.example.plist";
-  const auto preferences = Preferences::make(directories_);
-  for (const char* text : {"<plist", "<plist version=\"1.0\"><array/></plist>"}) {
-    write(path, text);
-    for (int i = 0; i < 3; ++i) EXPECT_TRUE(preferences->preferenceValue("com.example", "key").isNothing());
-    const Strings lines = log.take();
-    ASSERT_EQ(lines.size(), 1U) << text;
-    EXPECT_TRUE(lines[0].starts_with("ERROR -: cannot use " + path + ": ")) << lines[0];
-  }
 }
 
 TEST_F(PlatformServicesTest, NoPostOfSeveralProcessesIsLost) {

@@ -30,21 +30,6 @@ class PlatformTest : public testing::Test {
   Directories directories_;
 };
 
-TEST_F(PlatformTest, OneProcessHasAStateDirectoryAtATime) {
-  Error error;
-  auto first = Platform::make(directories_, &error);
-  ASSERT_NE(first, nullptr) << error.describe();
-  EXPECT_EQ(Platform::make(directories_, &error), nullptr);
-  EXPECT_EQ(error.code, EWOULDBLOCK);
-  EXPECT_NE(error.localizedDescription().find(directories_.state + "/lock"), std::string::npos);
-  // A copy with one service replaced, as tests and embedders make it, keeps the lock.
-  auto copy = std::make_shared<Platform>(*first);
-  first.reset();
-  EXPECT_EQ(Platform::make(directories_, nullptr), nullptr);
-  copy.reset();
-  EXPECT_NE(Platform::make(directories_, &error), nullptr);
-}
-
 TEST_F(PlatformTest, DirectoriesAndCountersAreThereWhenItIsMade) {
   std::filesystem::create_directories(directories_.state);
   std::filesystem::permissions(directories_.state, std::filesystem::perms::owner_all);

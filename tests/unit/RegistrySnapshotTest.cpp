@@ -64,24 +64,6 @@ TEST(RegistrySnapshotTest, AChangeSharesWhatStaysAndLeavesTheOldSnapshotAsItWas)
   EXPECT_EQ(lost->containingApplication->bundleURL->path(), "/a.app") << "a record keeps its application";
 }
 
-TEST(RegistrySnapshotTest, DeclarationsFollowTheApplicationsThatMakeThem) {
-  const auto declaring = [](const char* parent, int number) {
-    const Value type = Dictionary{{"HXTypeIdentifier", "png"}, {"HXTypeConformsTo", parent}};
-    const Dictionary points{{"point", Dictionary{{"Number", number}}}, {"odd", "text"}};
-    return Dictionary{{"HXTypeDeclarations", Array{type}}, {"HXExtensionPoints", points}};
-  };
-  const SnapshotPtr empty = std::make_shared<const RegistrySnapshot>();
-  const SnapshotPtr both =
-      empty->changed({group("/b.app", {}, declaring("photo", 2)), group("/a.app", {}, declaring("image", 1))}, {});
-  EXPECT_TRUE(both->types().conformsTo("png", "photo"));
-  EXPECT_EQ(both->extensionPoint("point")["Number"], Value(1)) << "of several the first by path";
-  EXPECT_TRUE(both->extensionPoint("odd").isNothing());
-  const SnapshotPtr one = both->changed({group("/c.app", {"c"})}, {})->changed({}, {"/a.app"});
-  EXPECT_TRUE(one->types().conformsTo("png", "photo"));
-  EXPECT_FALSE(one->types().conformsTo("png", "image"));
-  EXPECT_EQ(one->extensionPoint("point")["Number"], Value(2));
-}
-
 // The rules as the daemon applies them, written as plainly as possible.
 namespace oracle {
 

@@ -43,37 +43,6 @@ class RegistryStoreTest : public ::testing::Test {
   tests::LogCapture log_;
 };
 
-TEST_F(RegistryStoreTest, KeepsEverythingAChangeSaid) {
-  const RegistrationPtr first = registration("/a");
-  const BundleStamp mark = first->stamp;
-  {
-    StoredRegistry stored;
-    RegistryStore store(path_, stored);
-    EXPECT_TRUE(stored.registrations.empty());
-    EXPECT_TRUE(store.write({{first, registration("/b")},
-                             {},
-                             {{"x", "x", "app", "/app"}, {"x@2", "x", "", ""}},
-                             {{"/added", true}, {"/brief", true}},
-                             {{"/removed", mark}, {"/again", mark}}}));
-    EXPECT_TRUE(store.write({{}, {"/b"}, {{"x", "x", "app", "/moved"}}, {{"/brief", false}}, {{"/again", {}}}}));
-  }
-  StoredRegistry stored;
-  RegistryStore store(path_, stored);
-  ASSERT_EQ(stored.registrations.size(), 1U);
-  const BundleRegistration& again = *stored.registrations.at("/a");
-  EXPECT_EQ(again.uuid, first->uuid);
-  EXPECT_EQ(again.date, first->date);
-  EXPECT_EQ(again.stamp, first->stamp);
-  EXPECT_EQ(again.info, first->info);
-  EXPECT_EQ(again.names.at(0).displayName, "Anzeige");
-  ASSERT_EQ(stored.containers.size(), 2U);
-  EXPECT_EQ(stored.containers[0].applicationPath, "/moved");
-  EXPECT_EQ(stored.added, std::set<std::string>{"/added"});
-  EXPECT_EQ(stored.removed, (std::map<std::string, BundleStamp>{{"/removed", mark}}));
-  EXPECT_EQ(log_.take(), std::vector<std::string>());
-  EXPECT_EQ(fs::status(path_).permissions(), fs::perms::owner_read | fs::perms::owner_write);
-}
-
 TEST_F(RegistryStoreTest, ADamagedDatabaseIsSetAsideAndBegunAnewNeverReadWrong) {
   std::map<std::string, Uuid> written;
   {

@@ -140,19 +140,6 @@ TEST_F(SandboxTokenTest, NothingOutsideOfTheBundleIsGranted) {
   EXPECT_TRUE(sandbox_->issueFileReadExtension(bundle_ + "/images", directory_.path("alias"), &error_));
 }
 
-TEST_F(SandboxTokenTest, GrantedPlacesAreReadOnlyAndHaveNothingAbove) {
-  fs::create_symlink("cat", bundle_ + "/images/link");
-  const UniqueFd tree = open(*issue(bundle_));
-  ASSERT_TRUE(tree) << error_;
-  expectReadOnlyView(tree.get());
-
-  const UniqueFd file = open(*issue(bundle_ + "/images/cat"));
-  ASSERT_TRUE(file) << error_;
-  EXPECT_EQ(readAll(file.get()), "miaow");
-  EXPECT_LT(::open(("/proc/self/fd/" + std::to_string(file.get())).c_str(), O_RDWR), 0);
-  EXPECT_EQ(errno, EROFS);
-}
-
 // A daemon without rights over its mount namespace, as a user's own is.
 TEST_F(SandboxTokenTest, AnUnprivilegedDaemonGrantsTheSame) {
   fs::create_symlink("cat", bundle_ + "/images/link");

@@ -2,7 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include <atomic>
 #include <future>
 #include <memory>
 #include <numeric>
@@ -11,7 +10,6 @@
 #include <thread>
 #include <vector>
 
-#include "platform/queue/ConcurrentQueue.h"
 #include "platform/queue/DeferredWork.h"
 #include "platform/queue/Group.h"
 #include "platform/value/InternalInconsistency.h"
@@ -19,17 +17,6 @@
 
 namespace platform {
 namespace {
-
-TEST(SerialQueueTest, RunsItemsOneAtATimeInTheOrderOfSubmission) {
-  const SerialQueue queue("order");
-  std::vector<int> seen;  // unguarded: the queue alone orders the accesses
-  for (int i = 0; i < 1000; ++i) {
-    queue.async([&seen, i] { seen.push_back(i); });
-  }
-  std::vector<int> expected(1000);
-  std::iota(expected.begin(), expected.end(), 0);
-  EXPECT_EQ(queue.sync([&] { return seen; }), expected);
-}
 
 TEST(SerialQueueTest, AsynchronousAndSynchronousCallersOfManyThreadsExcludeEachOther) {
   const SerialQueue queue("shared");
@@ -226,22 +213,6 @@ TEST(GroupTest, LeavingMoreOftenThanEnteringIsABrokenContract) {
   group.leave();
   group.leave();
   EXPECT_THROW(group.leave(), InternalInconsistency);
-}
-
-TEST(ConcurrentQueueTest, RunsWorkOnAllOfItsThreadsAtOnce) {
-  ConcurrentQueue& queue = ConcurrentQueue::shared();
-  ASSERT_GE(queue.width(), 1U);
-  std::atomic<std::size_t> inside = 0;
-  Group group;
-  group.enter(queue.width());
-  for (std::size_t i = 0; i < queue.width(); ++i) {
-    queue.async([&] {
-      ++inside;
-      EXPECT_TRUE(tests::eventually([&] { return inside == queue.width(); }));
-      group.leave();
-    });
-  }
-  group.wait();
 }
 
 }  // namespace

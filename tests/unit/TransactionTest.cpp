@@ -2,10 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include <algorithm>
-#include <fstream>
-
-#include "Extora/XTDaemonClient.h"
 #include "platform/ipc/IpcCodec.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/PrintDescribed.h"
@@ -49,86 +45,11 @@ class TransactionTest : public ::testing::Test {
     EXPECT_EQ(connection_->replies.size(), 1U);
     return connection_->replies.empty() ? Failure() : failureOf(connection_->replies[0].body);
   }
-  /// The identifiers of a "match", sorted.
-  Lines match(const Value& rules = {}, std::uint64_t flags = 0) {
-    const auto reply = serve({{"request", "match"}, {"rules", rules}, {"flags", flags}});
-    EXPECT_TRUE(reply["matches"].isMessage()) << reply.describe();
-    Lines identifiers;
-    const Value forms = platform::fromWireMessage(reply["matches"]);
-    for (const Value& form : forms.items()) identifiers.push_back(form["identifier"].string());
-    std::sort(identifiers.begin(), identifiers.end());
-    return identifiers;
-  }
 
   tests::TestServer test_;
   std::shared_ptr<tests::FakeConnection> connection_ = std::make_shared<tests::FakeConnection>();
   std::shared_ptr<XTDIpcClient> client_ = test_.connect(connection_);
 };
-
-TEST_F(TransactionTest, VersionsTwoAndThreeAreServed) {
-  const Failure served{15, "Cannot locate PlugIn"};
-  for (const std::uint64_t version : {2, 3}) {
-    EXPECT_EQ(failureOf(serve({{"request", "find"}, {"version", version}})), served);
-  }
-  for (const Value& version :
-       {Value(std::uint64_t{1}), Value(std::uint64_t{4}), Value(3), Value(std::uint64_t{1} << 32), Value("3")}) {
-    const auto shown = std::to_string(version.exactUnsigned());
-    EXPECT_EQ(failureOf(serve({{"request", "find"}, {"version", version}})),
-              (Failure{7, "unsupported protocol version " + shown + " (current 3)"}));
-  }
-  EXPECT_EQ(failureOf(test_.serve(*connection_, {})), (Failure{7, "unsupported protocol version 0 (current 3)"}));
-}
-
-TEST_F(TransactionTest, TypesAreComparedExactly) {
-  const Failure missing{4, "invalid request format (missing type)"};
-  EXPECT_EQ(failureOf(serve({})), missing);
-  EXPECT_EQ(failureOf(serve({{"request", std::uint64_t{1}}})), missing);
-  for (const char* type : {"Match", "match ", "", "finds"}) {
-    EXPECT_EQ(failureOf(serve({{"request", type}})), (Failure{4, "unrecognized request"})) << type;
-  }
-}
-
-TEST_F(TransactionTest, PathsAreVisitedUntilOneIsBad) {
-  const auto file = test_.platform.directory.path("file");
-  const auto link = test_.platform.directory.path("link");
-  const auto none = test_.platform.directory.path("none");
-  std::ofstream(file) << "x";
-  std::filesystem::create_symlink("file", link);
-  const struct {
-    Value paths;
-    Lines visited;
-    Failure failure;
-  } cases[] = {
-      {Value(), {}, {4, "invalid request format"}},
-      {"/x", {}, {4, "invalid request format"}},
-      {Array{link, std::uint64_t{1}, none}, {"+" + file}, {4, "invalid request format"}},
-      {Array{link, "relative/path"}, {"+" + file}, {9, "absolute path required: relative/path"}},
-      {Array{none, none + "/../file", ""}, {"-" + none, "-" + none + "/../file"}, {9, "absolute path required: "}},
-      {Array{link, none}, {"+" + file, "-" + none}, {}},
-      {Array{}, {}, {}},
-  };
-  for (const auto& test : cases) {
-    SCOPED_TRACE(test.paths.describe());
-    Lines visited;
-    const auto subject = transaction({{"paths", test.paths}});
-    const bool all = subject->processPaths([&](const std::string& path, bool exists) {
-      visited.push_back((exists ? "+" : "-") + path);
-      return true;
-    });
-    EXPECT_EQ(all, test.failure == Failure());
-    EXPECT_EQ(visited, test.visited);
-    EXPECT_EQ(sentFailure(), test.failure);
-  }
-  const auto subject = transaction({{"paths", Array{"/a", "/b"}}});
-  int visits = 0;
-  EXPECT_FALSE(subject->marshalPaths([&](const auto&, bool) {
-    ++visits;
-    subject->fail(9, "stop");
-    return false;
-  }));
-  EXPECT_EQ(visits, 1);
-  EXPECT_EQ(sentFailure(), (Failure{9, "stop"}));
-}
 
 TEST_F(TransactionTest, PlugInsAreFoundByUuidElseByPath) {
   const auto a = test_.install(sampleRecord("com.a"));
@@ -237,83 +158,6 @@ TEST_F(TransactionTest, FindIgnoresWhatHostsMayUseAndTheLocationDecides) {
   EXPECT_EQ(failureOf(find(a->uuid().text(), a->uuid())), notFound) << "each of the other's type";
   EXPECT_EQ(failureOf(find({}, {})), notFound);
   EXPECT_EQ(find(a->uuid(), {}, 2), Value(Dictionary())) << "version 2 has no encoding for forms";
-}
-
-TEST_F(TransactionTest, MatchChecksItsArguments) {
-  const Failure unauthorized{11, "unauthorized discovery flag (XTDiscoverAll)"};
-  const auto request = [&](const Value& rules, const Value& flags) {
-    return failureOf(serve({{"request", "match"}, {"rules", rules}, {"flags", flags}}));
-  };
-  EXPECT_EQ(request("x", std::uint64_t{0x200}), (Failure{4, "invalid request format (bad rules dictionary)"}));
-  EXPECT_EQ(request({}, std::uint64_t{0x200}), unauthorized);
-  test_.rights->entitlements = {{XTManagerEntitlement, true}};
-  EXPECT_EQ(request({}, std::uint64_t{0x200}), Failure());
-  test_.rights->sandboxed = true;
-  EXPECT_EQ(request({}, std::uint64_t{0x200}), unauthorized);
-  EXPECT_EQ(request({}, 0x200), Failure()) << "flags of another type are no flags";
-}
-
-TEST_F(TransactionTest, MatchOffersWhatTheHostMayUse) {
-  const auto installed = sampleRecord("com.app");
-  auto system = sampleRecord("com.system");
-  system.onSystemPartition = true;
-  auto outside = sampleRecord("com.outside");
-  outside.bundleURL = Url::file("/System/PlugIns/outside.appex");
-  auto dedicated = sampleRecord("com.dedicated");
-  setPlugInDictionary(dedicated, {{XTDedicatedInfoKey, true}, {XTAttributesInfoKey, Dictionary()}});
-  auto secret = sampleRecord("com.secret");
-  setPlugInDictionary(secret, {{XTHostEntitlementInfoKey, "com.example.key"}, {XTAttributesInfoKey, Dictionary()}});
-  for (const auto& record : {installed, system, dedicated, secret}) test_.install(record);
-  test_.platform.registry->install(std::nullopt, {outside});
-  const auto held = test_.install(sampleRecord("com.held"));
-  const auto hold = std::make_shared<XTDPlugInHold>(std::vector{held}, client_);
-  test_.server->addHold(hold);
-
-  EXPECT_EQ(match(), Lines({"com.app", "com.system"}));
-  EXPECT_EQ(match({}, XTDiscoverSystemOnly), Lines({"com.system"}));
-  EXPECT_EQ(match(Dictionary{{XTIdentifierAttribute, "<>com.app"}}), Lines({"com.system"}));
-  test_.rights->entitlements = {{"com.example.key", true}, {XTManagerEntitlement, true}};
-  EXPECT_EQ(match(), Lines({"com.app", "com.secret", "com.system"}));
-  test_.server->unholdToken(hold->uuid());
-  EXPECT_EQ(match(), Lines({"com.app", "com.held", "com.secret", "com.system"}));
-
-  const Lines all = {"com.app", "com.dedicated", "com.held", "com.outside", "com.secret", "com.system"};
-  EXPECT_EQ(match({}, XTDiscoverAll), all);
-  test_.preferences->values = {
-      {XTExclusionsPreferenceKey, Array{7, Dictionary{{XTIdentifierAttribute, Array{"com.app", "com.held"}}}}}};
-  tests::LogCapture log("ops=info");
-  EXPECT_EQ(match({}, XTDiscoverAll), Lines({"com.dedicated", "com.outside", "com.secret", "com.system"}));
-  const auto lines = log.take();
-  EXPECT_EQ(
-      std::count_if(lines.begin(), lines.end(), [](const auto& line) { return line.ends_with(" globally excluded"); }),
-      2);
-}
-
-TEST_F(TransactionTest, MatchOffersEachOfManyOnce) {
-  Lines expected;
-  for (int i = 0; i < 700; ++i) {
-    expected.push_back("com.example." + std::to_string(1000 + i));
-    test_.install(sampleRecord(expected.back()));
-  }
-  EXPECT_EQ(match(), expected);
-  const auto reply = serve({{"request", "match"}, {"version", std::uint64_t{2}}});
-  EXPECT_EQ(reply, Value(Dictionary())) << "version 2 has no encoding for forms";
-}
-
-TEST_F(TransactionTest, MatchSaysWhatItFound) {
-  test_.platform.registry->silent = true;
-  tests::LogCapture log("ops=info");
-  EXPECT_EQ(match(Dictionary{{"x", "y"}}), Lines());
-  auto lines = log.take();
-  std::erase_if(lines, [](const auto& line) { return line.find(" plugin count: ") == std::string::npos; });
-  EXPECT_EQ(lines, Lines({"INFO ops: Candidate plugin count: 0", "INFO ops: Resulting plugin count: 0"}));
-  const auto plugIn = test_.install(sampleRecord("com.a", {{XTVersionAttribute, "1.5"}}));
-  log.take();
-  EXPECT_EQ(match(), Lines{"com.a"});
-  lines = log.take();
-  const auto has = [&](const std::string& line) { return std::count(lines.begin(), lines.end(), line) == 1; };
-  EXPECT_TRUE(has("INFO ops: Candidate plugin count: 1, info: [\"com.a(1.5) " + plugIn->uuid().text() + "\"]"));
-  EXPECT_TRUE(has("INFO ops: Resulting plugin count: 1, UUIDs: [\"" + plugIn->uuid().text() + "\"]"));
 }
 
 }  // namespace

@@ -4,9 +4,7 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
-#include <cmath>
 #include <limits>
-#include <thread>
 
 #include "platform/files/UniqueFd.h"
 #include "platform/value/InternalInconsistency.h"
@@ -130,21 +128,6 @@ TEST(ValueTest, AWriteNeverReachesWhoeverSharesTheNode) {
   for (int i = 0; i < 100; ++i) list.append(list[0]);
   EXPECT_EQ(list[102], Value("first"));
   EXPECT_THROW(list.set(103, 0), InternalInconsistency);
-}
-
-TEST(ValueTest, ThreadsMayCopyAndDropTheSameValue) {
-  const Value shared = Dictionary{{"list", Array{"a", "b"}}};
-  const auto work = [&shared] {
-    for (int i = 0; i < 10'000; ++i) {
-      Dictionary mine(shared);
-      if (i % 100 == 0) mine.set("list", i);
-    }
-  };
-  std::thread first(work);
-  std::thread second(work);
-  first.join();
-  second.join();
-  EXPECT_EQ(shared, Value(Dictionary{{"list", Array{"a", "b"}}}));
 }
 
 TEST(ValueTest, ADescriptorLivesAsLongAsItsLastValue) {

@@ -2,7 +2,6 @@
 #include <gtest/gtest.h>
 
 #include <cerrno>
-#include <set>
 #include <unordered_set>
 
 #include "platform/value/DateText.h"

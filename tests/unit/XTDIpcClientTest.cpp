@@ -128,18 +128,5 @@ TEST_F(XTDIpcClientTest, WhatADeadClientLeftBehindIsDroppedUnlessItsVersionIsWro
   EXPECT_EQ(connection_->replies[0].body["errorcode"].exactUnsigned(), 7U);
 }
 
-TEST_F(XTDIpcClientTest, WhatIsNoRequestIsOnlyLogged) {
-  tests::LogCapture log;
-  connection_->deliver(IpcMessage{1, true, platform::Array{"find"}});
-  connection_->deliver(IpcError{IpcError::Kind::BrokenInput, "bad frame"});
-  const auto lines = log.take();
-  ASSERT_EQ(lines.size(), 2U);
-  EXPECT_TRUE(lines[0].starts_with("ERROR ops: unexpected message: ")) << lines[0];
-  EXPECT_TRUE(lines[0].ends_with(" from: " + kPid)) << lines[0];
-  EXPECT_EQ(lines[1], "ERROR ops: unexpected error type from ipc: bad frame");
-  EXPECT_TRUE(client_->acceptWork());
-  EXPECT_EQ(test_.serve(*connection_, kFind)["errorcode"].exactUnsigned(), 15U);
-}
-
 }  // namespace
 }  // namespace extora

@@ -32,24 +32,6 @@ class XTDPlugInTest : public ::testing::Test {
   std::shared_ptr<tests::FakeRegistry> registry_ = std::make_shared<tests::FakeRegistry>();
 };
 
-TEST_F(XTDPlugInTest, TakesTheRecordsFacts) {
-  ARExtoraProxy record = sampleRecord("com.a", {{"HXExtensionVersion", "2.1"}}, Dictionary{{"x", "y"}});
-  record.onSystemPartition = true;
-  const auto plugIn = make(record);
-  ASSERT_TRUE(plugIn);
-  EXPECT_EQ(plugIn->uuid(), *record.plugInUUID);
-  EXPECT_EQ(plugIn->identifier(), "com.a");
-  EXPECT_EQ(plugIn->originalIdentifier(), "com.a.original");
-  EXPECT_EQ(plugIn->path(), "/Apps/com.a.app/PlugIns/com.a.appex");
-  EXPECT_EQ(plugIn->containingPath(), "/Apps/com.a.app");
-  EXPECT_EQ(plugIn->version(), "2.1");
-  EXPECT_EQ(plugIn->lastModified(), 1'000'000'000);
-  EXPECT_TRUE(plugIn->onSystemVolume());
-  EXPECT_EQ(plugIn->entitlements(), Value(Dictionary{{"x", "y"}}));
-  EXPECT_EQ(plugIn->plugInDictionary(), record.plugInDictionary);
-  EXPECT_EQ(plugIn->localizedContainingName(), "com.a app");
-}
-
 TEST_F(XTDPlugInTest, RefusesWhatItsSelfCheckRefuses) {
   tests::LogCapture log("info");
   ARExtoraProxy record = sampleRecord("com.a");
@@ -82,18 +64,6 @@ TEST_F(XTDPlugInTest, HubProtocolVersion) {
   EXPECT_EQ(make(record)->hubProtocolVersion(), 1U);
   setPlugInDictionary(record, {{"HXExtensionAttributes", Dictionary()}, {"HubProtocolVersion", 3}});
   EXPECT_EQ(make(record)->hubProtocolVersion(), 3U);
-}
-
-TEST_F(XTDPlugInTest, EntitlementsAndTheAnnotationKey) {
-  const auto plugIn = make(sampleRecord(
-      "com.a", {},
-      Dictionary{{"false", false}, {"zero", 0}, {"true", true}, {"one", 1}, {"text", ""}, {"list", Array()}}));
-  for (const char* name : {"absent", "false", "zero"}) EXPECT_FALSE(plugIn->hasEntitlement(name)) << name;
-  for (const char* name : {"true", "one", "text", "list"}) EXPECT_TRUE(plugIn->hasEntitlement(name)) << name;
-  EXPECT_EQ(plugIn->annotationKey(), "com.a");
-  const std::string key(XTOverrideEntitlement);
-  EXPECT_EQ(make(sampleRecord("com.b", {}, Dictionary{{key, "com.z"}}))->annotationKey(), "com.z");
-  EXPECT_EQ(make(sampleRecord("com.c", {}, Dictionary{{key, Array{"com.z"}}}))->annotationKey(), "com.c");
 }
 
 TEST_F(XTDPlugInTest, OneStampMarksEveryValueCurrent) {

@@ -239,17 +239,6 @@ class XTDaemonClientService : public testing::Test {
   tests::LogCapture log_;
 };
 
-TEST_F(XTDaemonClientService, WithoutAListenerTheFirstRequestFails) {
-  const auto client = XTDaemonClient::initWithServiceName("com.example.nobody");
-  std::optional<Error> error;
-  client->matchPlugIns({}, XTDiscoverSynchronously,
-                       [&error](const IpcReplyObject& reply) { error = XTDaemonClient::errorInReply(reply); });
-  ASSERT_TRUE(error.has_value());
-  EXPECT_EQ(error->code, 4);
-  EXPECT_NE(error->description->find(runtime_ + "/services/com.example.nobody"), std::string::npos)
-      << error->describe();
-}
-
 TEST_F(XTDaemonClientService, AReleasedClientGetsItsReplyAndThenClosesTheConnection) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;

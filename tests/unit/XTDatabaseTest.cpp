@@ -4,7 +4,6 @@
 
 #include <algorithm>
 
-#include "platform/value/InternalInconsistency.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/PrintDescribed.h"
 #include "tests/support/TestPlatform.h"
@@ -184,26 +183,6 @@ TEST_F(XTDatabaseTest, ElectionFilters) {
                            "DEBUG ops: AR reported 3 plug-ins (cache 7/8)"}) {
     EXPECT_EQ(std::count(lines.begin(), lines.end(), line), 1) << line;
   }
-}
-
-TEST_F(XTDatabaseTest, AutoElectionKeepsWhatTheUserSaid) {
-  ARExtoraProxy record = sampleRecord("com.a", {}, Dictionary{{XTAutoElectEntitlement, "yes"}});
-  const auto rebuilt = [&] {
-    platform_.locale->change();
-    drain();
-    return database_->annotationForPlugIn(*database_->findPlugIn(*record.plugInUUID));
-  };
-  const auto plugIn = install(record);
-  EXPECT_EQ(database_->annotationForPlugIn(*plugIn), Value(Dictionary{{"election", 1}}));
-  EXPECT_TRUE(plugIn->match(Dictionary{{"HXUserElection", "1"}}));
-  EXPECT_TRUE(install(sampleRecord("com.b"))->match(Dictionary{{"HXUserElection", "0"}}));
-  database_->setAnnotation(Dictionary{{"election", -3}, {"extension", Dictionary{{"k", "v"}}}}, *plugIn);
-  EXPECT_EQ(rebuilt()["election"], Value(-3));
-  database_->setAnnotation(Dictionary{{"election", 0}}, *plugIn);
-  EXPECT_EQ(rebuilt(), Value(Dictionary{{"election", 1}, {"extension", Dictionary{{"k", "v"}}}}));
-  EXPECT_TRUE(platform_.notifications->posted.empty());
-  database_->notifyAnnotationChange();
-  EXPECT_EQ(platform_.notifications->posted, Lines{"com.orvane.extora.annotation-change"});
 }
 
 class Receiver : public XTDatabaseDelegate {

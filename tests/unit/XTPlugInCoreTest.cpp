@@ -47,15 +47,6 @@ TEST(XTPlugInCore, SetupFailuresAndTheirLines) {
   EXPECT_EQ(log.take(), Lines{"DEFAULT ops: multiplexed plug-ins (Multiple key) obsolete and ignored"});
 }
 
-TEST(XTPlugInCore, SetupTellsItsNameAtDebugLevel) {
-  tests::LogCapture log("debug");
-  const auto plugIn = record(infoWith({}));
-  EXPECT_EQ(log.take(), (Lines{"DEBUG ops: setDictionaries: MailFilter",
-                               "DEBUG ar: setupWithName:url:bundleInfo:info:uuid: MailFilter"}));
-  EXPECT_TRUE(plugIn->infoKey("Nowhere").isNothing());
-  EXPECT_EQ(log.take(), Lines{"DEBUG ar: infoKey: Nowhere => (null)"});
-}
-
 TEST(XTPlugInCore, IdentityIsTheUuidAlone) {
   const auto a = record({});
   const auto b = record({});
@@ -65,15 +56,6 @@ TEST(XTPlugInCore, IdentityIsTheUuidAlone) {
   copy.setIdentifier("com.example.other");
   EXPECT_EQ(copy, *a);
   EXPECT_EQ(copy.hash(), a->hash());
-}
-
-TEST(XTPlugInCore, InfoArgumentServesOnlyWithoutAnInfoPlist) {
-  const Dictionary given = {{"HXExtensionProtocol", "Given"}};
-  const auto without = XTPlugInCore::initWithName("a", kPlain, {}, given, std::nullopt);
-  EXPECT_EQ(without->protocolSpec(), Value("Given"));
-  EXPECT_TRUE(without->bundleInfoDictionary().isNothing());
-  const auto with = XTPlugInCore::initWithName("a", kPlain, infoWith({}), given, std::nullopt);
-  EXPECT_TRUE(with->protocolSpec().isNothing());
 }
 
 TEST(XTPlugInCore, AppExtensionsHaveDefaults) {
@@ -112,13 +94,6 @@ TEST(XTPlugInCore, StylesAreReadFromTheMetadata) {
   EXPECT_THROW((void)plugIn.oldStyle(), platform::InternalInconsistency);
 }
 
-TEST(XTPlugInCore, LookUpsThroughWrongKindsAnswerNothing) {
-  const auto plugIn = record(infoWith({{"HXExtensionAttributes", "text"}}));
-  EXPECT_TRUE(plugIn->attributes().isNothing());
-  EXPECT_TRUE(plugIn->attribute("HXExtensionVersion").isNothing());
-  EXPECT_EQ(plugIn->version(), std::nullopt);
-}
-
 TEST(XTPlugInCore, CanonicalizeCompletesTheVersion) {
   const auto versionAfter = [](Dictionary plugIn, const Value& marketing) {
     Dictionary info = infoWith(std::move(plugIn));
@@ -136,16 +111,6 @@ TEST(XTPlugInCore, CanonicalizeCompletesTheVersion) {
   XTPlugInCore empty;
   empty.canonicalize();
   EXPECT_EQ(empty.plugInDictionary()["HXExtensionAttributes"]["HXExtensionVersion"], Value("1"));
-}
-
-TEST(XTPlugInCore, SetAnnotationReplacesTheDictionary) {
-  const auto plugIn = record({});
-  plugIn->setAnnotation("election", 1);
-  const Value before = plugIn->annotations();
-  plugIn->setAnnotation("extension", Dictionary{});
-  plugIn->setAnnotation("election", {});
-  EXPECT_EQ(before, Value(Dictionary{{"election", 1}}));
-  EXPECT_EQ(plugIn->annotations(), Value(Dictionary{{"extension", Dictionary{}}}));
 }
 
 TEST(XTPlugInCore, LocalizedInfoForHosts) {

@@ -1,4 +1,4 @@
-#include "Extora/XTUtilities.h"
+#include "Extora/XTBundle.h"
 
 #include <gtest/gtest.h>
 
@@ -6,21 +6,11 @@
 #include <filesystem>
 #include <fstream>
 
-#include "Extora/XTBundle.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/PrintDescribed.h"
 
 namespace extora {
 namespace {
-
-TEST(XTUtilities, VersionsOrderByTheirNumbers) {
-  const std::vector<const char*> ascending = {"", "1.0", "1.0.1", "1.0a", "1.0b", "1.9", "1.10", "2.0", "10.0"};
-  for (std::size_t i = 0; i < ascending.size(); ++i) {
-    for (std::size_t j = 0; j < ascending.size(); ++j) {
-      EXPECT_EQ(compareVersionString(ascending[i], ascending[j]), i <=> j) << ascending[i] << " " << ascending[j];
-    }
-  }
-}
 
 class XTBundleTest : public testing::Test {
  protected:
@@ -51,7 +41,7 @@ TEST_F(XTBundleTest, ABundleIsFoundByItsPathAndByItsExecutable) {
     EXPECT_EQ(bundle->executablePath(), app_ / "bin/mail");
     EXPECT_EQ(bundle->plugInsPath(), app_ / "PlugIns");
     EXPECT_EQ(bundle->bundleIdentifier(), "com.example.mail");
-    EXPECT_EQ(bundle->infoDictionary()["HBBundleExecutable"], Value("bin/mail"));
+    EXPECT_EQ(bundle->infoDictionary()["HBBundleExecutable"], platform::Value("bin/mail"));
   }
 }
 
