@@ -161,7 +161,9 @@ int Daemon::run(const std::vector<std::string>& arguments) {
 
 int Daemon::stop() {
   process_->signal(SIGTERM);
-  return process_->wait();
+  const int status = process_->wait();
+  if (status != 0) std::cerr << "--- log of the daemon that ended with status " << status << "\n" << log() << "---\n";
+  return status;
 }
 
 bool Daemon::waitForLog(std::string_view text, std::size_t count) {
