@@ -13,6 +13,7 @@
 #include "platform/files/UniqueFd.h"
 #include "platform/log/Log.h"
 #include "platform/queue/Mutex.h"
+#include "platform/queue/ThreadRoster.h"
 #include "platform/queue/WorkGuard.h"
 
 namespace platform {
@@ -162,6 +163,7 @@ void MainRunLoop::stop() {
 void MainRunLoop::exitProcess(int status) {
   Log::flush();
   (void)std::fflush(nullptr);
+  ThreadRoster::reapAll();
   ::_exit(status);
 }
 

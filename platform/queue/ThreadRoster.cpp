@@ -20,12 +20,12 @@ Rosters& rosters() {
   return *instance;
 }
 
-void reapAll() {
+}  // namespace
+
+void ThreadRoster::reapAll() {
   MutexLock lock(rosters().mutex);
   for (ThreadRoster* roster : rosters().all) roster->reap();
 }
-
-}  // namespace
 
 ThreadRoster::ThreadRoster(std::string name) : name_(std::move(name)) {
   MutexLock lock(rosters().mutex);

@@ -24,6 +24,8 @@ class ThreadRoster {
   [[nodiscard]] bool start(std::function<void()> body);
   /// Joins the threads whose bodies have ended.
   void reap();
+  /// The same for every roster of the process.
+  static void reapAll();
 
  private:
   void retire(std::list<std::thread>::iterator self);
