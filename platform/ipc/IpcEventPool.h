@@ -39,6 +39,7 @@ class IpcEventPool {
   [[nodiscard]] std::uint64_t add(int fd, std::weak_ptr<IpcEventSource> source);
   /// From here on the next event is handled, once.
   void arm(int fd, std::uint64_t token);
+  /// From here on none is, but for the end of both directions, which may still come once.
   void disarm(int fd, std::uint64_t token);
   /// Before `fd` is closed.
   void remove(int fd, std::uint64_t token);

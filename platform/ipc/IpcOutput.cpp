@@ -73,10 +73,14 @@ bool IpcOutput::enqueue(Frame& frame, std::size_t sent) {
 }
 
 void IpcOutput::flush() {
+  std::shared_ptr<IpcOutput> keptUntilReturn;
   MutexLock lock(mutex_);
   if (!socket_) return;
   sendBacklog();
-  if (backlog_.empty() && watch_ != 0) IpcWriter::shared().unwatch(socket_.get(), std::exchange(watch_, 0));
+  if (!backlog_.empty()) return;
+  if (watch_ != 0) IpcWriter::shared().unwatch(socket_.get(), std::exchange(watch_, 0));
+  keptUntilReturn.swap(closing_);
+  if (keptUntilReturn) closeNow();
 }
 
 void IpcOutput::sendBacklog() {
@@ -179,6 +183,19 @@ void IpcOutput::shutdown() {
 
 void IpcOutput::close() {
   MutexLock lock(mutex_);
+  if (!closing_) closeNow();
+}
+
+void IpcOutput::closeWhenSent() {
+  MutexLock lock(mutex_);
+  if (backlog_.empty()) {
+    closeNow();
+  } else {
+    closing_ = shared_from_this();
+  }
+}
+
+void IpcOutput::closeNow() {
   if (watch_ != 0) IpcWriter::shared().unwatch(socket_.get(), std::exchange(watch_, 0));
   dropBacklog();
   socket_.reset();

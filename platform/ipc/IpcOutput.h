@@ -55,6 +55,8 @@ class IpcOutput : public std::enable_shared_from_this<IpcOutput> {
   void shutdown();
   /// Closes the socket and drops the backlog. Nobody may read from it any more.
   void close();
+  /// As close(), but what waits is sent before, for as long as the peer takes it.
+  void closeWhenSent();
 
   /// For the writer: sends what the socket takes now.
   void flush();
@@ -77,6 +79,7 @@ class IpcOutput : public std::enable_shared_from_this<IpcOutput> {
   bool enqueue(Frame& frame, std::size_t sent) XT_REQUIRES(mutex_);
   void sendBacklog() XT_REQUIRES(mutex_);
   void dropBacklog() XT_REQUIRES(mutex_);
+  void closeNow() XT_REQUIRES(mutex_);
   void retryLater() XT_REQUIRES(mutex_);
 
   // Constant after the first send.
@@ -91,6 +94,7 @@ class IpcOutput : public std::enable_shared_from_this<IpcOutput> {
   bool memoryFileUnread_ XT_GUARDED_BY(mutex_) = false;
   std::uint64_t watch_ XT_GUARDED_BY(mutex_) = 0;  // the writer's token while there is a backlog
   bool retrying_ XT_GUARDED_BY(mutex_) = false;
+  std::shared_ptr<IpcOutput> closing_ XT_GUARDED_BY(mutex_);  // itself, from closeWhenSent() until all is sent
 };
 
 }  // namespace platform

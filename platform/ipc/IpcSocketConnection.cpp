@@ -1,6 +1,7 @@
 #include "platform/ipc/IpcSocketConnection.h"
 
 #include <fmt/format.h>
+#include <poll.h>
 #include <sys/socket.h>
 
 #include <cerrno>
@@ -127,12 +128,22 @@ std::string IpcSocketConnection::describe() const {
 // Reading.
 
 void IpcSocketConnection::handleEvent() {
+  bool ended = false;
   {
     MutexLock lock(mutex_);
-    if (claim_ != Claim::Armed) return;
+    ended = claim_ == Claim::Serving;
+    if (claim_ != Claim::Armed && !ended) return;
     claim_ = Claim::Reading;
+    if (ended) {
+      sendRest_ = false;
+      end();
+    }
   }
-  release(reader_.read(socket_, MSG_DONTWAIT, *this), false);
+  if (ended) {
+    finish();
+  } else {
+    release(reader_.read(socket_, MSG_DONTWAIT, *this), false);
+  }
 }
 
 // Ends the claim of the calling thread: the connection is read on by whoever is next, or has come to its end.
@@ -143,9 +154,16 @@ void IpcSocketConnection::release(IpcFrameReader::Outcome outcome, bool synchron
     if (outcome == Outcome::Broken) malformed_ = reader_.brokenReason();
     {
       MutexLock lock(mutex_);
+      if (outcome == Outcome::EndOfInput && !cancelled_ && peerListens()) {
+        sendRest_ = true;
+        if (unserved_ > 0) {
+          claim_ = Claim::Serving;
+          IpcEventPool::shared().disarm(socket_, token_);
+          return;
+        }
+      }
       if (ended && !cancelled_) {
-        valid_ = false;
-        reason_ = malformed_.empty() ? "the peer has gone" : malformed_;
+        end();
       } else if (!cancelled_ && unserved_ >= kIpcMaxUnservedRequests) {
         claim_ = Claim::Paused;
         return;
@@ -158,6 +176,17 @@ void IpcSocketConnection::release(IpcFrameReader::Outcome outcome, bool synchron
     outcome = reader_.resume(*this);
   }
   finish();
+}
+
+// Whether the peer of a service that sends nothing more takes replies still.
+bool IpcSocketConnection::peerListens() const {
+  struct pollfd entry = {socket_, 0, 0};
+  return settings_.service && ::poll(&entry, 1, 0) == 0;
+}
+
+void IpcSocketConnection::end() {
+  valid_ = false;
+  reason_ = malformed_.empty() ? "the peer has gone" : malformed_;
 }
 
 void IpcSocketConnection::park(bool synchronous) {
@@ -200,6 +229,12 @@ void IpcSocketConnection::lookAtResting() {
 void IpcSocketConnection::requestServed() {
   MutexLock lock(mutex_);
   --unserved_;
+  if (claim_ == Claim::Serving && unserved_ == 0) {
+    claim_ = Claim::Reading;
+    end();
+    ThreadPool::workers().submit([self = self()] { self->finish(); });
+    return;
+  }
   if (claim_ != Claim::Paused || unserved_ >= kIpcMaxUnservedRequests) return;
   if (!reader_.hasRefused()) {
     park(false);
@@ -216,9 +251,11 @@ void IpcSocketConnection::finish() {
   std::unordered_map<std::uint64_t, Pending> pending;
   IpcError invalid;
   std::uint64_t token = 0;
+  bool sendRest = false;
   {
     MutexLock lock(mutex_);
     claim_ = Claim::Ended;
+    sendRest = sendRest_ && !cancelled_;
     invalid = invalidError();
     token = token_;
     ownReference.swap(self_);
@@ -231,7 +268,11 @@ void IpcSocketConnection::finish() {
     waiters_.clear();
   }
   if (token != 0) IpcEventPool::shared().remove(socket_, token);
-  output_->close();
+  if (sendRest) {
+    output_->closeWhenSent();
+  } else {
+    output_->close();
+  }
   reader_.abandon();
   for (auto& [id, request] : pending) {
     request.queue.async([reply = std::move(request.reply), invalid] { reply({Value(), invalid}); });

@@ -7,7 +7,8 @@
 //
 // Reading. Exactly one thread at a time reads, decodes and delivers: the one that has turned `claim_` into Reading.
 // That is a thread of IpcEventPool when the socket is armed there, or a caller of sendWithReplySync, which reads its
-// own reply without a change of threads, or a worker that goes on after a pause. release() says who comes next.
+// own reply without a change of threads, or a worker that goes on after a pause. release() says who comes next. A
+// service's connection whose peer has closed only its own direction ends when all its requests have been served.
 //
 // Locks: mutex_ is a leaf but for the event pool's and is never held while a handler, a reply function or the codec
 // runs.
@@ -78,6 +79,7 @@ class IpcSocketConnection final : public IpcConnection,
     Resting,  // nobody waits; a caller of sendWithReplySync is about to come, or may come soon
     Reading,  // one thread reads or delivers
     Paused,   // too many requests are unserved
+    Serving,  // the peer sends nothing more, and waits for its last replies
     Ended,    // never to be read again
   };
   // Handler and context, which go together and last until the last event has been delivered.
@@ -113,6 +115,8 @@ class IpcSocketConnection final : public IpcConnection,
   void release(IpcFrameReader::Outcome outcome, bool synchronous);
   void finish();
 
+  bool peerListens() const;
+  void end() XT_REQUIRES(mutex_);
   void park(bool synchronous) XT_REQUIRES(mutex_);
   void arm() XT_REQUIRES(mutex_);
   void watchResting() XT_REQUIRES(mutex_);
@@ -148,8 +152,9 @@ class IpcSocketConnection final : public IpcConnection,
   std::uint64_t token_ XT_GUARDED_BY(mutex_) = 0;
   std::shared_ptr<IpcSocketConnection> self_ XT_GUARDED_BY(mutex_);  // of a service, while it is resumed
   bool cancelled_ XT_GUARDED_BY(mutex_) = false;
-  bool failed_ XT_GUARDED_BY(mutex_) = false;  // made by makeFailed, and not resumed yet
-  std::string reason_ XT_GUARDED_BY(mutex_);   // why it is invalid
+  bool sendRest_ XT_GUARDED_BY(mutex_) = false;  // the peer sends nothing more, but takes what waits for it
+  bool failed_ XT_GUARDED_BY(mutex_) = false;    // made by makeFailed, and not resumed yet
+  std::string reason_ XT_GUARDED_BY(mutex_);     // why it is invalid
   std::size_t unserved_ XT_GUARDED_BY(mutex_) = 0;
   std::uint64_t lastId_ XT_GUARDED_BY(mutex_) = 0;
   std::unordered_map<std::uint64_t, Pending> pending_ XT_GUARDED_BY(mutex_);

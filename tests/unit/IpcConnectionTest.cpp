@@ -254,6 +254,34 @@ TEST(IpcConnectionTest, BrokenInputEndsItsConnectionAfterWhatCameBefore) {
   }
 }
 
+TEST(IpcConnectionTest, APeerWithoutFurtherRequestsGetsItsRepliesUnlessItGoes) {
+  std::vector<IpcMessage> unserved;
+  ServiceEnd service([&](ServiceEnd&, const IpcMessage& message) { unserved.push_back(message); });
+  service.client->write(request(1, Dictionary{}) + request(2, Dictionary{}) + request(3, Dictionary{}));
+  ::shutdown(service.client->fd(), SHUT_WR);
+  ASSERT_EQ(service.events.waitFor(3).size(), 3U);
+  for (const IpcMessage& message : unserved) {
+    IpcReply reply = ipcCreateReply(message);
+    reply.body.set("text", std::string(200'000, 'x'));  // only one of them is taken at once
+    service.connection->send(reply);
+  }
+  EXPECT_EQ(service.events.waitFor(4).back(), "invalid: the peer has gone");
+  for (const std::uint64_t id : {1U, 2U, 3U}) {
+    const auto reply = service.client->readFrame();
+    EXPECT_EQ(reply.header.id, id);
+    EXPECT_EQ(reply.body["text"].string().size(), 200'000U);
+  }
+  EXPECT_TRUE(service.client->atEnd());
+
+  unserved.clear();
+  ServiceEnd waiting([&](ServiceEnd&, const IpcMessage& message) { unserved.push_back(message); });
+  waiting.client->write(request(1, Dictionary{}));
+  ::shutdown(waiting.client->fd(), SHUT_WR);
+  ASSERT_EQ(waiting.events.waitFor(1).size(), 1U);
+  waiting.client->close();
+  EXPECT_EQ(waiting.events.waitFor(2).back(), "invalid: the peer has gone") << "though nobody has answered";
+}
+
 TEST(IpcConnectionTest, DescriptorsFromAClientAreClosedAtOnceAndBreakItsConnection) {
   std::array<int, 2> ends{};
   ASSERT_EQ(::pipe2(ends.data(), O_CLOEXEC), 0);
