@@ -2,6 +2,7 @@
 #include <nettle/base64.h>
 
 #include <cmath>
+#include <cstring>
 #include <string_view>
 
 #include "platform/plist/PropertyList.h"
@@ -82,18 +83,17 @@ class PropertyListWriter {
     return line(depth, "</dict>");
   }
 
-  bool writeText(std::string_view text, std::string_view element, std::size_t depth) {
+  bool writeText(const std::string& text, std::string_view element, std::size_t depth) {
     if (!isXmlText(text)) return refuse("a string with characters that XML lacks");
     out_.append(depth, '\t');
     (out_ += '<').append(element) += '>';
-    std::size_t plain = 0;  // what needs no escape is copied at once
-    for (std::size_t at = 0; at < text.size(); ++at) {
-      const std::string_view escape = escapeOf(text[at]);
-      if (escape.empty()) continue;
-      out_.append(text, plain, at - plain).append(escape);
-      plain = at + 1;
+    // There is no NUL in such a text, and the library looks at many characters at once.
+    for (const char* rest = text.c_str(); *rest != '\0';) {
+      const std::size_t plain = std::strcspn(rest, "&<>\r");
+      out_.append(rest, plain);
+      rest += plain;
+      if (*rest != '\0') out_ += escapeOf(*rest++);
     }
-    out_.append(text, plain);
     (out_ += "</").append(element) += ">\n";
     return true;
   }
@@ -106,10 +106,8 @@ class PropertyListWriter {
         return "&lt;";
       case '>':
         return "&gt;";
-      case '\r':
-        return "&#13;";  // as it stands a reader would make a line feed of it
       default:
-        return {};
+        return "&#13;";  // a carriage return, of which a reader would make a line feed
     }
   }
 
