@@ -32,8 +32,8 @@ class XTSandboxExtension {
   /// What consuming gave; -1 while it is not consumed.
   std::int64_t handle() const { return handle_; }
   void setHandle(std::int64_t handle) { handle_ = handle; }
-  /// What a consumed file token grants: the file or directory, opened for reading; what lies in a directory is reached by
-  /// openat(). -1 otherwise. The extension owns it.
+  /// What a consumed file token grants: the file or directory, opened for reading; what lies in a directory is reached
+  /// by openat(). -1 otherwise. The extension owns it.
   int descriptor() const { return descriptor_.get(); }
 
  private:

@@ -1,10 +1,10 @@
 // IpcFrameReader: takes the bytes and descriptors of one socket apart into frames, and keeps what is unfinished.
 //
 // 1. Bytes are received into a pooled buffer; a frame that lies there whole is handed on from there, without a copy.
-// Only
-//    the rest of an unfinished frame is kept, in a buffer of its own into which the next read goes directly.
+//    Only the rest of an unfinished frame is kept, in a buffer of its own into which the next read goes directly.
 // 2. What is broken is found as soon as its bytes are there, whatever a length claims; frames before it were handed on.
 // 3. The receiver may refuse to take a further frame: the reader keeps what it has and goes on with resume().
+//
 // Not safe for two threads at once: whoever reads the connection owns it.
 #pragma once
 

@@ -1,15 +1,13 @@
 // IpcOutput: what one connection sends, in order, without ever waiting.
 //
 // 1. A frame goes to the socket straight from the thread that sends it. What the socket does not take at once waits in
-// the
-//    backlog, which the writer thread (IpcWriter) goes on with when the socket has room.
+//    the backlog, which the writer thread (IpcWriter) goes on with when the socket has room.
 // 2. The frame at the head of the backlog is the one being sent; those behind it count, memory files in full, and must
-// not
-//    exceed the bound.
+//    not exceed the bound.
 // 3. At most one memory file is with the peer unread. Whether it has been taken is asked of the socket: nothing that
-// was
-//    sent is unread any more (SIOCOUTQ). Frames behind a waiting memory file wait too, so that this is bound to happen,
-//    and the socket's report of room wakes the writer each time that the peer has taken something.
+//    was sent is unread any more (SIOCOUTQ). Frames behind a waiting memory file wait too, so that this is bound to
+//    happen, and the socket's report of room wakes the writer each time that the peer has taken something.
+//
 // Callable from any thread. Shared by the connection and the writer.
 #pragma once
 

@@ -5,8 +5,7 @@
 //    whoever stops being that thread hands the line on (next()): to the caller at its head, to a thread of the pool, or
 //    to nobody when the line is empty.
 // 3. `promisedTo` means not busy, but items wait for the end of an event handler (DeferredWork). Whoever else comes to
-// the
-//    queue takes the promise back first.
+//    the queue takes the promise back first.
 #pragma once
 
 #include <condition_variable>

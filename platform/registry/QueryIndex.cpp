@@ -1,7 +1,7 @@
 // What makes it safe to leave a record out:
 // 1. Only rules that say equality count: a string without operator or with "=", or alternatives of such. Everything
-// else
-//    (other operators, booleans, dictionaries, the user's election, which is no property of a record) narrows nothing.
+//    else (other operators, booleans, dictionaries, the user's election, which is no property of a record) narrows
+//    nothing.
 // 2. Values are looked up where the rules look: the keys with a meaning of their own, then attributes, then Info.plist.
 // 3. Equality is that of the numeric order, which is what leaving out leading zeros keeps.
 #include "platform/registry/QueryIndex.h"

@@ -11,7 +11,6 @@ namespace platform {
 namespace {
 
 namespace fs = std::filesystem;
-using tests::installBundle;
 using tests::sampleApplication;
 using tests::SampleBundle;
 using tests::samplePlugIn;

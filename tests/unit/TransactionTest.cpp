@@ -14,7 +14,6 @@ using Lines = std::vector<std::string>;
 using platform::Array;
 using platform::IpcMessage;
 using tests::sampleRecord;
-using tests::setPlugInDictionary;
 
 constexpr std::uint64_t kVersion = 3;
 
