@@ -37,15 +37,15 @@ class PropertyListWriter {
       case Kind::Boolean:
         return line(depth, value.exactBoolean() ? "<true/>" : "<false/>");
       case Kind::Signed:
-        return line(depth, fmt::format("<integer>{}</integer>", value.exactSigned()));
+        return writeElement("integer", fmt::format_int(value.exactSigned()).c_str(), depth);
       case Kind::Unsigned:
-        return line(depth, fmt::format("<integer>{}</integer>", value.exactUnsigned()));
+        return writeElement("integer", fmt::format_int(value.exactUnsigned()).c_str(), depth);
       case Kind::Real:
         if (!std::isfinite(value.realValue())) return refuse("a real that is not finite");
-        return line(depth, fmt::format("<real>{}</real>", value.realValue()));
+        return writeElement("real", fmt::format("{}", value.realValue()), depth);
       case Kind::Date: {
         const std::optional<std::string> text = dateText(value.date());
-        return text ? line(depth, fmt::format("<date>{}</date>", *text)) : refuse("a date beyond the year 9999");
+        return text ? writeElement("date", *text, depth) : refuse("a date beyond the year 9999");
       }
       case Kind::String:
         return writeText(value.string(), "string", depth);
@@ -114,7 +114,15 @@ class PropertyListWriter {
   bool writeData(const Bytes& bytes, std::size_t depth) {
     std::string text(BASE64_ENCODE_RAW_LENGTH(bytes.size()), '\0');
     base64_encode_raw(text.data(), bytes.size(), bytes.data());
-    return line(depth, fmt::format("<data>{}</data>", text));
+    return writeElement("data", text, depth);
+  }
+
+  // `text` needs no escape.
+  bool writeElement(std::string_view element, std::string_view text, std::size_t depth) {
+    out_.append(depth, '\t');
+    ((out_ += '<').append(element) += '>').append(text);
+    (out_ += "</").append(element) += ">\n";
+    return true;
   }
 
   bool line(std::size_t depth, std::string_view text) {
