@@ -24,20 +24,14 @@ ARExtoraProxy sampleRecord(const std::string& identifier, const Dictionary& attr
   record.bundleURL = Url::file(fmt::format("/Apps/{0}.app/PlugIns/{0}.appex", identifier));
   record.bundleIdentifier = identifier;
   record.bundleVersion = "7.1";
-  setPlugInDictionary(record, {{"HXExtensionAttributes", attributes}});
+  record.plugInDictionary = Dictionary{{"HXExtensionAttributes", attributes}};
+  record.infoDictionary = Dictionary{{"HXExtension", record.plugInDictionary}};
   record.entitlements = entitlements;
   record.registrationDate = 1'000'000'000.75;
   record.dataContainerURL = Url::file(fmt::format("/Containers/{}", identifier));
   record.localizedName = identifier + " name";
   record.localizedShortName = identifier + " short";
   return record;
-}
-
-void setPlugInDictionary(ARExtoraProxy& record, const Dictionary& dictionary) {
-  record.plugInDictionary = dictionary;
-  Dictionary info(record.infoDictionary);
-  info.set("HXExtension", dictionary);
-  record.infoDictionary = info;
 }
 
 PlugInRecord FakeRegistry::install(ARExtoraProxy plugIn) {
@@ -59,7 +53,7 @@ std::shared_ptr<const InstalledGroup> FakeRegistry::install(std::optional<ARAppl
     group->application->plugIns.push_back(&group->plugIns.back());
   }
   groups_.push_back(group);
-  touch();
+  knowledge = Uuid::random();
   return group;
 }
 
@@ -72,7 +66,7 @@ void FakeRegistry::uninstall(const Uuid& plugIn, bool tellObservers) {
   if (place == groups_.end()) return;
   const std::shared_ptr<const InstalledGroup> group = *place;
   groups_.erase(place);
-  touch();
+  knowledge = Uuid::random();
   if (!tellObservers) return;
   PlugInRecords gone;
   for (std::size_t i = 0; i < group->plugIns.size(); ++i) gone.push_back(platform::plugInRecord(group, i));
@@ -89,9 +83,7 @@ PlugInRecords FakeRegistry::registryInstalledPlugIns() {
   return all;
 }
 
-std::optional<PlugInRecords> FakeRegistry::registryPlugInsMatching(const Value& query, const Filter& filter) {
-  lastQuery = query;
-  if (silent) return std::nullopt;
+std::optional<PlugInRecords> FakeRegistry::registryPlugInsMatching(const Value&, const Filter& filter) {
   PlugInRecords found = registryInstalledPlugIns();
   std::erase_if(found,
                 [&](const PlugInRecord& record) { return !filter(record->plugInIdentifier, record->entitlements); });
@@ -99,7 +91,6 @@ std::optional<PlugInRecords> FakeRegistry::registryPlugInsMatching(const Value& 
 }
 
 PlugInRecord FakeRegistry::registryPlugInByUUID(const Uuid& uuid) {
-  ++lookups;
   for (const PlugInRecord& record : registryInstalledPlugIns()) {
     if (record->plugInUUID == uuid) return record;
   }
@@ -107,7 +98,6 @@ PlugInRecord FakeRegistry::registryPlugInByUUID(const Uuid& uuid) {
 }
 
 PlugInRecord FakeRegistry::registryPlugInByURL(const Url& url) {
-  ++lookups;
   for (const PlugInRecord& record : registryInstalledPlugIns()) {
     if (record->bundleURL == url) return record;
   }
@@ -123,13 +113,6 @@ platform::ApplicationRecord FakeRegistry::registryAppByBundleURL(const Url& url)
 
 void FakeRegistry::registryAddObserver(std::weak_ptr<platform::RegistryObserver> observer) {
   observers_.push_back(std::move(observer));
-}
-
-Dictionary FakeRegistry::registryLocalizedValues(const PlugInRecord&, const std::vector<std::string>& keys,
-                                                 const std::string& table) {
-  Dictionary values;
-  for (const std::string& key : keys) values.set(key, localized[table][key]);
-  return values;
 }
 
 bool FakeRegistry::typeConformsTo(const std::string& type, const std::string& other) {

@@ -1,9 +1,7 @@
-// FakeRegistry: an application registry of records that a test hands it; counts what it is asked. Changed by one thread
-// at a time. sampleRecord gives a plug-in that passes the self-check, to be changed before it is installed.
+// FakeRegistry: an application registry of records that a test hands it. Changed by one thread at a time.
+// sampleRecord gives a plug-in that passes the self-check, to be changed before it is installed.
 #pragma once
 
-#include <atomic>
-#include <map>
 #include <memory>
 #include <set>
 #include <string>
@@ -18,8 +16,6 @@ namespace tests {
 /// `entitlements` are its own.
 platform::ARExtoraProxy sampleRecord(const std::string& identifier, const platform::Dictionary& attributes = {},
                                      const platform::Value& entitlements = {});
-/// Replaces the plug-in dictionary, also where the Info.plist has it.
-void setPlugInDictionary(platform::ARExtoraProxy& record, const platform::Dictionary& dictionary);
 
 class FakeRegistry : public platform::ApplicationRegistry {
  public:
@@ -30,8 +26,6 @@ class FakeRegistry : public platform::ApplicationRegistry {
                                                           std::vector<platform::ARExtoraProxy> plugIns);
   /// Forgets a plug-in together with its application and all of its plug-ins, and tells the observers if asked to.
   void uninstall(const platform::Uuid& plugIn, bool tellObservers);
-  /// New knowledge, with the data unchanged.
-  void touch() { knowledge = platform::Uuid::random(); }
 
   platform::PlugInRecords registryInstalledPlugIns() override;
   std::optional<platform::PlugInRecords> registryPlugInsMatching(const platform::Value& query,
@@ -42,8 +36,10 @@ class FakeRegistry : public platform::ApplicationRegistry {
   void registryClearSchemaCaches() override { ++clears; }
   void registryAddObserver(std::weak_ptr<platform::RegistryObserver> observer) override;
   std::optional<platform::Uuid> registryKnowledgeUUID() override { return knowledge; }
-  platform::Dictionary registryLocalizedValues(const platform::PlugInRecord& record,
-                                               const std::vector<std::string>& keys, const std::string& table) override;
+  platform::Dictionary registryLocalizedValues(const platform::PlugInRecord&, const std::vector<std::string>&,
+                                               const std::string&) override {
+    return {};
+  }
   platform::Value registryExtensionPointSDK(const std::string&) override { return {}; }
   std::optional<platform::Error> registryRegisterPlugin(const platform::Url&) override { return std::nullopt; }
   std::optional<platform::Error> registryUnregisterPlugin(const platform::Url&) override { return std::nullopt; }
@@ -51,15 +47,9 @@ class FakeRegistry : public platform::ApplicationRegistry {
   bool evaluateActivationRule(const platform::Value& rule, const platform::Value& items) override;
 
   std::optional<platform::Uuid> knowledge = platform::Uuid::random();
-  /// Queries get no list.
-  bool silent = false;
-  /// table -> key -> text, of every plug-in.
-  std::map<std::string, platform::Dictionary> localized;
   /// (type, what it conforms to).
   std::set<std::pair<std::string, std::string>> conformances;
-  std::atomic<int> lookups = 0;  ///< of single plug-ins, by UUID or URL
-  int clears = 0;                ///< of the schema caches
-  platform::Value lastQuery;
+  int clears = 0;  ///< of the schema caches
 
  private:
   std::vector<std::shared_ptr<const platform::InstalledGroup>> groups_;

@@ -3,6 +3,8 @@
 
 #include "Extora/XTProtocol.h"
 #include "Extora/XTVocabulary.h"
+#include "platform/ipc/IpcCodec.h"
+#include "platform/value/Url.h"
 #include "tests/support/Daemon.h"
 #include "tests/support/SampleBundles.h"
 
@@ -63,6 +65,54 @@ TEST_F(DiscoveryTest, AFormTellsAllAboutAPlugIn) {
   EXPECT_TRUE(daemon_.waitForLog("INFO ops: Resulting plugin count: 1, UUIDs: [\"" + uuid + "\"]\n"));
   EXPECT_EQ(match(0, {{"x", "y"}}), Texts());
   EXPECT_TRUE(daemon_.waitForLog("INFO ops: Resulting plugin count: 0\n"));
+}
+
+TEST_F(DiscoveryTest, PlugInsAreNamedByUuidElseByPathAndALocationBeforeAUuid) {
+  const auto folder =
+      write(daemon_.applications(), "a", {samplePlugIn("com.example.x"), samplePlugIn("com.example.y")});
+  daemon_.start();
+  auto client = daemon_.connect();
+  const auto uuidOf = [&](const char* identifier) {
+    return *platform::Uuid::parse(client.match({{XTIdentifierAttribute, identifier}})[0]["uuid"].string());
+  };
+  const Value x = uuidOf("com.example.x");
+  const Value y = uuidOf("com.example.y");
+  const Value unknown = platform::Uuid::random();
+  const std::string pathOfY = folder + "/PlugIns/y.appex";
+  const std::string notFound = "4 no such plugin (uuid not found)";
+  const std::string looked = "INFO traffic: Failed to find plugin by " + unknown.uuid().text() + "\n";
+  const std::string byPath = "INFO traffic: Looking for plugin " + unknown.uuid().text() + " by path ";
+  const struct {
+    Value uuids, paths;
+    std::string failure, line;
+  } cases[] = {
+      {Value(), Value(), "4 invalid request format (uuid)", ""},
+      {x, Value(), "4 invalid request format (uuid)", ""},
+      {Array{x, x.uuid().text()}, Value(), "4 invalid request (bad uuid array)", ""},
+      {Array{x, unknown}, Value(), notFound, ""},
+      {Array{unknown}, "/x", notFound, "DEFAULT traffic: Paths present but not an array (ignoring values)\n"},
+      {Array{unknown, x}, Array{"/1", "/2", "/3"}, notFound,
+       "DEFAULT traffic: Paths present but has different count than UUIDs (ignoring)\n"},
+      {Array{unknown}, Array{7}, notFound, looked},
+      {Array{unknown}, Array{"/none"}, notFound, byPath + "/none\n"},
+      {Array{x, unknown}, Array{"/x", pathOfY}, "", byPath + pathOfY + "\n"},
+  };
+  for (const auto& each : cases) {
+    SCOPED_TRACE(each.uuids.describe() + " " + each.paths.describe());
+    const Value reply = client.request("access", {{"uuids", each.uuids}, {"paths", each.paths}});
+    EXPECT_EQ(tests::failureOf(reply), each.failure);
+    EXPECT_EQ(reply["extensions"].size(), each.failure.empty() ? 2U : 0U);
+    EXPECT_TRUE(daemon_.waitForLog(each.line));
+  }
+  const auto find = [&](const Value& uuid, const Value& location) {
+    const Value reply = client.request("find", {{"uuids", uuid}, {"paths", location}});
+    if (!reply["matches"]) return tests::failureOf(reply);
+    return platform::fromWireMessage(reply["matches"])["identifier"].string();
+  };
+  EXPECT_EQ(find(x, {}), "com.example.x");
+  EXPECT_EQ(find(x, platform::Url::file(pathOfY).absoluteString()), "com.example.y");
+  for (const char* none : {"file:///unknown", "/none"}) EXPECT_EQ(find(x, none), "15 Cannot locate PlugIn") << none;
+  EXPECT_EQ(find(y.uuid().text(), y), "15 Cannot locate PlugIn") << "each of the other's type";
 }
 
 TEST_F(DiscoveryTest, TheNewestVersionIsOfferedUnlessMoreAreAskedFor) {

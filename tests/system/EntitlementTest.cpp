@@ -254,9 +254,12 @@ TEST_F(EntitlementTest, TheUsersFilesCountAsSoonAsTheyCanBeRead) {
   tests::writePropertyList(preferences, Dictionary{{XTExclusionsPreferenceKey,
                                                     Array{Dictionary{{XTIdentifierAttribute, "com.example.a"}}}}});
   EXPECT_EQ(client.offered(), Texts{"com.example.keyboard 1.0"});
-  const Dictionary granted{{"com.orvane.consent.keyboard-network", true}};
-  tests::writePropertyList(consents, Dictionary{{"com.example.app", granted}});
-  profileIs("plugin");
+  for (const bool granted : {false, true}) {
+    const Value flag = granted ? Value(true) : Value(1);
+    const Dictionary services{{"com.orvane.consent.keyboard-network", flag}};
+    tests::writePropertyList(consents, Dictionary{{"com.example.app", services}});
+    profileIs(granted ? "plugin" : "keyboard");
+  }
 }
 
 }  // namespace

@@ -84,6 +84,8 @@ TEST_F(HoldTest, AHoldBlocksAnApplicationOrPlugInsUntilItIsReleased) {
   EXPECT_EQ(offered(), clocks_);
   EXPECT_EQ(failureOf(client.request("ready", {{"uuids", Array{*platform::Uuid::parse(a["uuid"].string())}}})),
             "11 access to plugin com.example.a denied: the plug-in is on hold");
+  const Value found = client.request("find", {{"uuids", *platform::Uuid::parse(a["uuid"].string())}});
+  EXPECT_TRUE(found["matches"].isMessage()) << "who asks for it by name is told of it";
   auto other = daemon_.connect();
   const Value one = lock(other, Array{pathOfA, pathOfA}, XTHoldFlagPlugInPaths | XTHoldFlagRefuseBusy);
   const Value nothing = lock(client, Array{}, XTHoldFlagTerminate);

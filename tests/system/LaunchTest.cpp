@@ -6,7 +6,6 @@
 #include <linux/sched.h>
 #include <signal.h>
 #include <sys/socket.h>
-#include <sys/stat.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -135,13 +134,6 @@ class LaunchTest : public testing::Test {
     const Value hold = client_->request(
         "lock", {{"paths", platform::Array{application_}}, {"flags", std::uint64_t{XTHoldFlagTerminate}}});
     EXPECT_EQ(tests::failureOf(client_->request("lock", {{"uuids", platform::Array{hold["uuids"]}}})), "");
-  }
-  bool isBusy() {
-    const Value reply = client_->request(
-        "lock", {{"paths", platform::Array{application_}}, {"flags", std::uint64_t{XTHoldFlagRefuseBusy}}});
-    if (reply["conflicts"]) return true;
-    (void)client_->request("lock", {{"uuids", platform::Array{reply["uuids"]}}});
-    return false;
   }
   // The exit status of a program that asks for a launch of the probe.
   int launchElsewhere(const char* how) {
@@ -383,22 +375,6 @@ TEST_F(LaunchTest, AnInstanceEndsWithItsHostAndWithTheDaemon) {
   const pid_t plugIn = std::stoi(textOf("/proc/" + first + "/task/" + first + "/children"));
   daemon_.process().signal(SIGKILL);
   EXPECT_TRUE(tests::eventually([&] { return ended(probe->pid) && ended(plugIn); }));
-}
-
-TEST_F(LaunchTest, BusyIsWhatAnInstanceSaysUntilItEndsItOrItself) {
-  start({{"EXTORA_RUNTIME_DIR", daemon_.runtime().string()}});
-  ASSERT_EQ(ready(), "");
-  const auto probe = launch();
-  ASSERT_NE(probe, nullptr) << error_.describe();
-  for (const auto& [ask, busy] : {std::pair{"begin", true}, {"end", false}, {"begin", true}}) {
-    ASSERT_EQ(probe->result({{"ask", ask}}), 0);
-    EXPECT_EQ(isBusy(), busy);
-  }
-  ::kill(probe->pid, SIGKILL);
-  EXPECT_TRUE(tests::eventually([&] { return !isBusy(); }));
-  const auto refusal = XTHostServices::beginActivity();
-  ASSERT_TRUE(refusal);
-  EXPECT_EQ(refusal->code, EPERM) << "a host is no instance";
 }
 
 TEST_F(LaunchTest, ExtensionsAreConsumedOnceAndReleasedByWhoConsumedThem) {

@@ -7,7 +7,6 @@
 
 #include <fstream>
 
-#include "Extora/XTProtocol.h"
 #include "Extora/XTVocabulary.h"
 #include "tests/support/Daemon.h"
 #include "tests/support/Eventually.h"

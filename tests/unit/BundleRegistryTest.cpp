@@ -26,57 +26,6 @@ class BundleRegistryTest : public tests::RegistryFixture {
   std::string container(const std::string& name) const { return options_.directories.state + "/Containers/" + name; }
 };
 
-TEST_F(BundleRegistryTest, KnowsEverythingInstalledWhenItHasStarted) {
-  SampleBundle filter = samplePlugIn("com.example.mail.filter", {{"HXExtensionIdentifier", "own.name"}});
-  filter.info.set("HBBundleVersion", 2.5);
-  filter.entitlements = Dictionary{{"right", true}};
-  SampleBundle mail = sampleApplication("com.example.mail", {filter, samplePlugIn("com.example.mail.second")});
-  mail.info.set("HBBundlePlaceholder", true);
-  writeBundle(apps_, mail);
-  writeBundle(directory_.path("system"), sampleApplication("com.example.clock", {samplePlugIn("com.example.hands")}));
-  writeBundle(directory_.path("plugins"), samplePlugIn("com.example.lone"));
-  writeBundle(directory_.path("plugins"), sampleApplication("no.plug-in"));
-  start();
-  EXPECT_EQ(names(), (Names{"com.example.hands", "com.example.lone", "com.example.mail.second", "own.name"}));
-
-  const PlugInRecord record = named("own.name");
-  EXPECT_EQ(record->bundleURL->path(), apps_ + "/mail.app/PlugIns/filter.appex");
-  EXPECT_EQ(record->originalIdentifier, "com.example.mail.filter");
-  EXPECT_EQ(record->bundleIdentifier, "com.example.mail.filter");
-  EXPECT_EQ(record->bundleVersion, "2.5");
-  EXPECT_EQ(record->infoDictionary, Value(filter.info));
-  EXPECT_EQ(record->plugInDictionary, filter.info["HXExtension"]);
-  EXPECT_EQ(record->entitlements, filter.entitlements);
-  EXPECT_FALSE(record->onSystemPartition);
-  EXPECT_NEAR(record->registrationDate, static_cast<double>(::time(nullptr)), 100);
-  const ApplicationRecord application = registry_->registryAppByBundleURL(Url::file(apps_ + "/mail.app"));
-  ASSERT_NE(application, nullptr);
-  EXPECT_EQ(record->containingApplication, application.get());
-  EXPECT_TRUE(application->isPlaceholder);
-  EXPECT_EQ(application->localizedName, "mail");
-  EXPECT_EQ(application->plugIns.size(), 2U);
-
-  EXPECT_TRUE(named("com.example.hands")->onSystemPartition);
-  EXPECT_TRUE(named("com.example.lone")->onSystemPartition);
-  EXPECT_EQ(named("com.example.lone")->containingApplication, nullptr);
-  EXPECT_TRUE(named("com.example.lone")->entitlements.isNothing());
-  EXPECT_EQ(registry_->registryPlugInByUUID(*record->plugInUUID), record);
-  EXPECT_EQ(registry_->registryPlugInByURL(*record->bundleURL), record);
-  EXPECT_EQ(registry_->registryPlugInByUUID(Uuid::random()), nullptr);
-  EXPECT_EQ(registry_->registryAppByBundleURL(*record->bundleURL), nullptr);
-  EXPECT_EQ(options_.notifications->counter(kRegistryChangeNotification), 0U);
-  EXPECT_EQ(log_.take(), Names());
-
-  Names asked;
-  const auto matching = registry_->registryPlugInsMatching(
-      Dictionary{{"HXExtensionVersion", "01.0"}}, [&](const std::string& identifier, const Value& entitlements) {
-        asked.push_back(identifier);
-        return entitlements["right"].booleanValue();
-      });
-  EXPECT_EQ(matching, PlugInRecords{record});
-  EXPECT_EQ(asked.size(), 4U);
-}
-
 TEST_F(BundleRegistryTest, ARestartKeepsWhatIsUnchangedWithoutReadingIt) {
   const std::string mail =
       writeBundle(apps_, sampleApplication("mail", {samplePlugIn("filter"), samplePlugIn("other")}));
@@ -253,45 +202,6 @@ TEST_F(BundleRegistryTest, AnswersSdkDictionariesOfTheSystemBeforeThoseOfApplica
   EXPECT_EQ(registry_->registryExtensionPointSDK("com.example.point"), theirs);
 }
 
-TEST_F(BundleRegistryTest, RegistersOneTrustedPlugInFromAnywhereAndRemembersIt) {
-  const std::string mail =
-      writeBundle(directory_.path(), sampleApplication("mail", {samplePlugIn("filter"), samplePlugIn("other")}));
-  const std::string filter = mail + "/PlugIns/filter.appex";
-  const std::string lone = writeBundle(directory_.path(), samplePlugIn("lone"));
-  start();
-  EXPECT_EQ(registry_->registryRegisterPlugin(Url::file(filter)), std::nullopt);
-  EXPECT_EQ(registry_->registryRegisterPlugin(Url::file(lone)), std::nullopt);
-  EXPECT_EQ(names(), (Names{"filter", "lone"}));
-  EXPECT_EQ(observer_->take(), (Names{"+filter", "+lone"}));
-  EXPECT_EQ(options_.notifications->counter(kRegistryChangeNotification), 2U);
-  EXPECT_EQ(named("lone")->containingApplication, nullptr);
-  ASSERT_NE(named("filter")->containingApplication, nullptr);
-  EXPECT_EQ(named("filter")->containingApplication->bundleURL->path(), mail);
-  const auto uuid = named("filter")->plugInUUID;
-  EXPECT_EQ(registry_->registryRegisterPlugin(Url::file(filter)), std::nullopt);
-  EXPECT_EQ(named("filter")->plugInUUID, uuid);
-  start();
-  EXPECT_EQ(names(), (Names{"filter", "lone"}));
-  EXPECT_EQ(named("filter")->plugInUUID, uuid);
-
-  // Away at one start, back at the next: the request still stands, but trust is asked for again.
-  fs::rename(lone, lone + ".away");
-  start();
-  EXPECT_EQ(names(), Names{"filter"});
-  fs::rename(lone + ".away", lone);
-  start();
-  EXPECT_EQ(names(), (Names{"filter", "lone"}));
-  fs::permissions(lone + "/Info.plist", fs::perms::group_write, fs::perm_options::add);
-  start();
-  EXPECT_EQ(names(), Names{"filter"});
-  EXPECT_EQ(registry_->registryUnregisterPlugin(Url::file(lone)), std::nullopt);
-  EXPECT_EQ(registry_->registryUnregisterPlugin(Url::file(filter)), std::nullopt);
-  EXPECT_EQ(observer_->take(), Names{"-filter"});
-  EXPECT_NE(registry_->registryUnregisterPlugin(Url::file(filter)), std::nullopt);
-  start();
-  EXPECT_EQ(names(), Names());
-}
-
 TEST_F(BundleRegistryTest, RefusesToRegisterWhatIsNoTrustedPlugIn) {
   const std::string mail = writeBundle(directory_.path(), sampleApplication("mail", {samplePlugIn("filter")}));
   const std::string filter = mail + "/PlugIns/filter.appex";
@@ -314,16 +224,6 @@ TEST_F(BundleRegistryTest, RefusesToRegisterWhatIsNoTrustedPlugIn) {
   EXPECT_TRUE(names().empty()) << "nothing of it is remembered";
   EXPECT_EQ(registry_->registryRegisterPlugin(Url::file(linked)), std::nullopt);
   EXPECT_EQ(named("filter")->bundleURL->path(), filter) << "paths of records are canonical";
-}
-
-TEST_F(BundleRegistryTest, FoldersMayBeMissingLinkedOrNamedTwice) {
-  const std::string linked = directory_.path("linked");
-  fs::create_directory_symlink(apps_, linked);
-  options_.directories.applications = {linked, apps_ + "/", directory_.path("missing/deeper"), ""};
-  writeBundle(apps_, sampleApplication("mail", {samplePlugIn("filter")}));
-  start();
-  EXPECT_EQ(names(), Names{"filter"});
-  EXPECT_EQ(named("filter")->bundleURL->path(), apps_ + "/mail.app/PlugIns/filter.appex");
 }
 
 }  // namespace

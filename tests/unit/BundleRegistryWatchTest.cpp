@@ -2,8 +2,6 @@
 #include <gtest/gtest.h>
 #include <stdio.h>
 
-#include <thread>
-
 #include "platform/registry/BundleRegistry.h"
 #include "tests/support/RegistryFixture.h"
 
@@ -91,51 +89,6 @@ TEST_F(BundleRegistryWatchTest, WithoutEnoughWatchesTheFoldersArePolled) {
   removeBundle(path);
   ASSERT_TRUE(waitForNames({}));
   EXPECT_EQ(linesWith("there are not enough file watches"), 1U) << "once";
-}
-
-TEST_F(BundleRegistryWatchTest, APlugInThatWasRegisteredByRequestIsFollowedToo) {
-  const std::string folder = directory_.path("vendor");
-  fs::create_directory(folder);
-  const std::string path =
-      writeBundle(folder, sampleApplication("mail", {samplePlugIn("filter"), samplePlugIn("not")}));
-  start();
-  ASSERT_EQ(registry_->registryRegisterPlugin(Url::file(path + "/PlugIns/filter.appex")), std::nullopt);
-  const auto first = named("filter")->plugInUUID;
-  fs::rename(path, path + ".away");
-  ASSERT_TRUE(waitForNames({}));
-  fs::rename(path + ".away", path);
-  ASSERT_TRUE(waitForNames({"filter"}));
-  EXPECT_NE(named("filter")->plugInUUID, first);
-  fs::remove_all(path + "/PlugIns/filter.appex");
-  ASSERT_TRUE(waitForNames({}));
-  EXPECT_EQ(observer_->take(), (Names{"+filter", "-filter", "+filter", "-filter"}));
-}
-
-TEST_F(BundleRegistryWatchTest, ReadersNeverWaitOrSeeHalfAChange) {
-  start();
-  std::atomic<bool> done = false;
-  std::atomic<bool> wrong = false;
-  std::thread reader([&] {
-    while (!done) {
-      const auto knowledge = registry_->registryKnowledgeUUID();
-      const SnapshotPtr now = registry_->snapshot();
-      for (const PlugInRecord& record : now->plugIns()) {
-        if (now->plugInByUUID(*record->plugInUUID) != record) wrong = true;
-        if (record->containingApplication->plugIns.size() != 2) wrong = true;
-      }
-      (void)registry_->registryPlugInsMatching(Dictionary{{"HXExtensionVersion", "1.0"}}, nullptr);
-      (void)knowledge;
-    }
-  });
-  const SampleBundle mail = sampleApplication("mail", {samplePlugIn("a"), samplePlugIn("b")});
-  for (int i = 0; i < 10; ++i) {
-    installBundle(apps_, mail);
-    locale_->changeTo(i % 2 == 0 ? "de" : "fr");
-    EXPECT_TRUE(waitForNames({"a", "b"}));
-  }
-  done = true;
-  reader.join();
-  EXPECT_FALSE(wrong);
 }
 
 }  // namespace

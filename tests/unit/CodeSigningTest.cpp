@@ -1,13 +1,11 @@
 #include "platform/signing/CodeSigning.h"
 
 #include <gtest/gtest.h>
-#include <sched.h>
 #include <sys/stat.h>
 
 #include <filesystem>
 #include <fstream>
 
-#include "platform/sandbox/Sandbox.h"
 #include "platform/signing/Sha1.h"
 #include "tests/support/ChildProcess.h"
 #include "tests/support/LogCapture.h"
@@ -120,42 +118,6 @@ TEST_F(CodeSigningTest, EntitlementsCountOnlyUnderTheRuleOfTrust) {
   EXPECT_EQ(trustProblem(app_ + "/missing")->code, 260);
 }
 
-TEST_F(CodeSigningTest, ARefusalIsAnErrorOnceAndForGood) {
-  const ChildProcess child(host_);
-  ASSERT_TRUE(child.running());
-  const auto early = signing_->taskForAuditToken(child.peer());
-  const auto late = signing_->taskForAuditToken(child.peer());
-  EXPECT_EQ(ask(*early), "yes");
-  ASSERT_EQ(::chmod(app_.c_str(), 0777), 0);
-  EXPECT_EQ(ask(*late), "error");
-  EXPECT_EQ(ask(*late), "nothing");
-  EXPECT_EQ(ask(*early), "nothing") << "not its first question";
-  ASSERT_EQ(::chmod(app_.c_str(), 0755), 0);
-  EXPECT_EQ(ask(*late), "nothing");
-  EXPECT_EQ(ask(*signing_->taskForAuditToken(child.peer())), "yes");
-}
-
-TEST_F(CodeSigningTest, AProcessThatHasEndedHasNoEntitlements) {
-  ChildProcess child(host_);
-  const auto task = signing_->taskForAuditToken(child.peer());
-  EXPECT_EQ(ask(*task), "yes");
-  child.end();
-  EXPECT_EQ(ask(*task), "nothing");
-  EXPECT_EQ(signing_->taskForAuditToken(child.peer()), nullptr);
-  EXPECT_EQ(signing_->taskForAuditToken(nullptr), nullptr);
-}
-
-TEST_F(CodeSigningTest, AnExecutableInNoBundleHasTheFileBesideIt) {
-  write(host_ + ".entitlements", R"(<plist version="1.0"><dict/></plist>)");
-  EXPECT_EQ(askFresh(host_), "yes") << "the bundle's count, not the file beside";
-  fs::remove(app_ + "/Info.plist");
-  EXPECT_EQ(askFresh(host_), "nothing");
-  write(host_ + ".entitlements", kRights);
-  EXPECT_EQ(askFresh(host_), "yes");
-  ASSERT_EQ(::chmod((host_ + ".entitlements").c_str(), 0666), 0);
-  EXPECT_EQ(askFresh(host_), "error");
-}
-
 TEST_F(CodeSigningTest, DamagedEntitlementsAreAnErrorAndSaidOncePerChange) {
   tests::LogCapture log;
   const std::string rights = app_ + "/Entitlements.plist";
@@ -184,21 +146,6 @@ TEST_F(CodeSigningTest, ABundleAnswersForTheExecutableItNames) {
     EXPECT_EQ(entitlementsOfBundle(app_, &error).isDictionary(), counts) << executable;
     EXPECT_EQ(error.domain.empty(), counts) << executable;
   }
-}
-
-TEST(SandboxTest, WhoHasAnotherRootOrUserNamespaceIsSandboxed) {
-  const auto sandbox = Sandbox::make();
-  EXPECT_FALSE(sandbox->isSandboxedByAuditToken(*PeerIdentity::ofSelf()));
-  ChildProcess plain("");
-  EXPECT_FALSE(sandbox->isSandboxedByAuditToken(*plain.peer()));
-  plain.end();
-  EXPECT_TRUE(sandbox->isSandboxedByAuditToken(*plain.peer())) << "ended";
-  const tests::TemporaryDirectory root;
-  const ChildProcess jailed("", [&] { return ::chroot(root.path().c_str()) == 0; });
-  EXPECT_TRUE(!jailed.running() || sandbox->isSandboxedByAuditToken(*jailed.peer()));
-  const ChildProcess apart("", [] { return ::unshare(CLONE_NEWUSER) == 0; });
-  EXPECT_TRUE(!apart.running() || sandbox->isSandboxedByAuditToken(*apart.peer()));
-  if (!jailed.running() && !apart.running()) GTEST_SKIP() << "neither chroot nor user namespaces here";
 }
 
 TEST(Sha1Test, AnswersTheDigestOfThePublishedExample) {

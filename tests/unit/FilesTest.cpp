@@ -69,30 +69,6 @@ TEST_F(FilesTest, WhatCannotBeReadSaysWhy) {
   EXPECT_EQ(content("/proc/self/comm").back(), '\n') << "a file that says it is empty";
 }
 
-TEST_F(FilesTest, DirectoriesHaveTheirModeWhateverTheUmask) {
-  const mode_t before = ::umask(077);
-  EXPECT_EQ(files_->createDirectory(directory_.path("a/b/c"), true, 0755), std::nullopt);
-  EXPECT_EQ(files_->createDirectory(directory_.path("a/b/c"), false, 0700), std::nullopt) << "exists";
-  ::umask(before);
-  EXPECT_EQ(modeOf(directory_.path("a")), 0755U);
-  EXPECT_EQ(modeOf(directory_.path("a/b/c")), 0755U);
-  EXPECT_EQ(files_->createDirectory(directory_.path("x/y"), false, 0700)->code, ENOENT);
-  std::ofstream(path_) << "x";
-  EXPECT_EQ(files_->createDirectory(path_, true, 0700)->code, EEXIST);
-  EXPECT_EQ(files_->createDirectory(path_ + "/y", true, 0700)->code, ENOTDIR);
-}
-
-TEST_F(FilesTest, ASecondNameNeverReplacesAFile) {
-  std::ofstream(path_) << "damaged";
-  const std::string second = directory_.path("second");
-  EXPECT_EQ(files_->linkFile(path_, second), std::nullopt);
-  ASSERT_EQ(files_->writeFileAtomic(path_, bytesOf("new")), std::nullopt);
-  EXPECT_EQ(files_->linkFile(path_, second), std::nullopt);
-  EXPECT_EQ(content(second), "damaged");
-  EXPECT_EQ(files_->linkFile(directory_.path("missing"), directory_.path("third"))->code, ENOENT);
-  EXPECT_EQ(files_->resolvePath(directory_.path("missing")), std::nullopt);
-}
-
 TEST_F(FilesTest, PathsOfProcessesFitTheirBuffers) {
   // Names of 255 bytes, the last so long that the path has the given length.
   for (const std::size_t length : {1023U, 1024U}) {

@@ -4,8 +4,6 @@
 #include <gtest/gtest.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
-#include <sys/stat.h>
-#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -15,7 +13,6 @@
 #include <utility>
 
 #include "platform/ipc/IpcServiceAddress.h"
-#include "tests/support/ChildProcess.h"
 #include "tests/support/Eventually.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/PrintDescribed.h"
@@ -87,32 +84,6 @@ class IpcListenerTest : public testing::Test {
   tests::Recorder<std::string> errors_;
   std::shared_ptr<IpcListener> listener_;
 };
-
-mode_t modeOf(const fs::path& path) {
-  struct stat status = {};
-  return ::stat(path.c_str(), &status) == 0 ? status.st_mode & 07777 : 0;
-}
-
-TEST_F(IpcListenerTest, ANameIsServedByOneAndFreeAgainAfterwards) {
-  const mode_t before = ::umask(077);
-  ASSERT_TRUE(serve()) << error_.describe();
-  ::umask(before);
-  EXPECT_EQ(modeOf(socketPath()), 0666U);
-  EXPECT_EQ(modeOf(socketPath().parent_path()), 0755U);
-  EXPECT_EQ(ask(runtime_), "ok");
-  EXPECT_EQ(accepted_.now().at(0)->peer()->pid(), ::getpid());
-
-  EXPECT_EQ(ipcCreateListener(runtime_, kService, queue_, &error_), nullptr);
-  EXPECT_NE(error_.describe().find("is already served"), std::string::npos) << error_.describe();
-  EXPECT_EQ(ask(runtime_), "ok");
-  EXPECT_NE(ipcCreateListener(runtime_, "com.example.other", queue_, &error_), nullptr);
-
-  listener_->cancel();
-  EXPECT_EQ(errors_.waitFor(1), std::vector<std::string>{"the listener was cancelled"});
-  EXPECT_FALSE(fs::exists(socketPath()));
-  EXPECT_EQ(ask(runtime_), "cannot connect to " + socketPath().string() + ": No such file or directory");
-  EXPECT_TRUE(serve()) << error_.describe();
-}
 
 TEST_F(IpcListenerTest, AStaleSocketIsReplacedAndNothingElseIs) {
   fs::create_directories(socketPath().parent_path());
@@ -214,27 +185,6 @@ TEST_F(IpcListenerTest, WhenDescriptorsRunOutAcceptingWaitsAndGoesOn) {
   EXPECT_EQ(lines,
             (std::vector<std::string>{"ERROR -: cannot accept connections to com.example.service for now: Too many "
                                       "open files"}));
-}
-
-TEST_F(IpcListenerTest, AnExecutableThatWasDeletedOrReplacedIsNoLongerThePeers) {
-  const fs::path program = fs::path(runtime_) / "program";
-  fs::copy_file("/bin/cat", program);
-  tests::ChildProcess child(program);
-  ASSERT_TRUE(child.running());
-  const auto pidfd = [&] { return UniqueFd(static_cast<int>(::syscall(SYS_pidfd_open, child.peer()->pid(), 0))); };
-  EXPECT_EQ(child.peer()->executablePath(), program);
-  EXPECT_TRUE(child.peer()->executableUnchanged());
-  fs::copy_file("/bin/cat", runtime_ + "/other");
-  fs::rename(runtime_ + "/other", program);
-  EXPECT_FALSE(child.peer()->executableUnchanged());
-  EXPECT_EQ(PeerIdentity::ofPidfd(pidfd().get())->executablePath(), "");
-  // Unless it is really called so.
-  const fs::path odd = fs::path(runtime_) / "program (deleted)";
-  fs::copy_file("/bin/cat", odd);
-  const tests::ChildProcess other(odd);
-  ASSERT_TRUE(other.running());
-  EXPECT_EQ(other.peer()->executablePath(), odd);
-  EXPECT_EQ(PeerIdentity::ofSelf()->executablePath(), fs::read_symlink("/proc/self/exe"));
 }
 
 }  // namespace

@@ -1,9 +1,6 @@
 #include <gtest/gtest.h>
-#include <linux/sched.h>
 #include <signal.h>
 #include <sys/syscall.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include <atomic>
 #include <cerrno>
@@ -14,6 +11,7 @@
 #include "platform/assertions/ProcessAssertions.h"
 #include "platform/jobs/ProcessJobManager.h"
 #include "platform/queue/MainRunLoop.h"
+#include "tests/support/ChildProcess.h"
 #include "tests/support/FakeRegistry.h"
 #include "tests/support/TestPlatform.h"
 
@@ -21,41 +19,18 @@ namespace platform {
 namespace {
 
 constexpr auto kDeadline = std::chrono::seconds(20);
-constexpr const char* kIdle = "exec sleep 1000";
 constexpr const char* kIdentifier = "com.example.filter";
 
-// A child process that is ended and reaped with the object.
-class Child {
+// A process that waits.
+class Child : public tests::ChildProcess {
  public:
-  explicit Child(const char* script, pid_t wantedPid = 0) {
-    struct clone_args arguments = {};
-    arguments.exit_signal = SIGCHLD;
-    if (wantedPid != 0) {
-      arguments.set_tid = reinterpret_cast<std::uintptr_t>(&wantedPid);
-      arguments.set_tid_size = 1;
-    }
-    pid_ = static_cast<pid_t>(::syscall(SYS_clone3, &arguments, sizeof arguments));
-    if (pid_ == 0) {
-      ::execl("/bin/sh", "sh", "-c", script, nullptr);
-      ::_exit(127);
-    }
-  }
+  Child() : ChildProcess("") {}
   ~Child() { end(); }
-  Child(const Child&) = delete;
-  Child& operator=(const Child&) = delete;
   void end() {
-    if (pid_ <= 0) return;
-    ::kill(pid_, SIGKILL);
-    (void)::waitpid(pid_, nullptr, 0);
-    pid_ = -1;
+    if (peer()->isAlive()) ::kill(peer()->pid(), SIGKILL);
+    ChildProcess::end();
   }
-  pid_t pid() const { return pid_; }
-  UniqueFd pidfd() const { return UniqueFd(static_cast<int>(::syscall(SYS_pidfd_open, pid_, 0))); }
-  std::shared_ptr<const PeerIdentity> identity() const { return PeerIdentity::ofPidfd(pidfd().get()); }
-  bool ended() const { return !identity()->isAlive(); }
-
- private:
-  pid_t pid_ = -1;
+  UniqueFd pidfd() const { return UniqueFd(static_cast<int>(::syscall(SYS_pidfd_open, peer()->pid(), 0))); }
 };
 
 class JobManagerTest : public testing::Test {
@@ -92,12 +67,12 @@ class JobManagerTest : public testing::Test {
 
   int add(const Child& host, const Value& variables = {}) {
     const Dictionary service{{"EnvironmentVariables", variables}, {"_SandboxProfile", "plugin"}};
-    return jobs_->jobAddExternalService(host.identity(), executable_, Dictionary{{"IPCService", service}});
+    return jobs_->jobAddExternalService(host.peer(), executable_, Dictionary{{"IPCService", service}});
   }
   // The launch, or nothing and the error number in refusal_.
   std::optional<JobManager::Launch> begin(const Child& host) {
     refusal_ = 0;
-    return jobs_->beginLaunch(host.identity(), executable_, &refusal_);
+    return jobs_->beginLaunch(host.peer(), executable_, &refusal_);
   }
   std::uint64_t start(const Child& host, const Child& instance) {
     EXPECT_EQ(add(host), 0);
@@ -128,33 +103,10 @@ class JobManagerTest : public testing::Test {
   std::atomic<int> answerCount_{0};
 };
 
-TEST_F(JobManagerTest, RemovalEndsInstancesAndAnswersOnce) {
-  const Child host(kIdle);
-  const Child first(kIdle);
-  const Child second(kIdle);
-  start(host, first);
-  start(host, second);
-  remove("2");
-  ASSERT_TRUE(answered(1));
-  EXPECT_EQ(answer_, JobManager::kNoneOnRecord) << "another version is not on record";
-  EXPECT_FALSE(first.ended());
-
-  remove();
-  ASSERT_TRUE(answered(2));
-  EXPECT_EQ(answer_, 0);
-  EXPECT_TRUE(first.ended());
-  EXPECT_TRUE(second.ended());
-  EXPECT_FALSE(begin(host));
-  EXPECT_EQ(refusal_, EPERM);
-  remove();
-  ASSERT_TRUE(answered(3));
-  EXPECT_EQ(answer_, JobManager::kNoneOnRecord);
-}
-
 TEST_F(JobManagerTest, ManyRemovalsOfWhatDoesNotEndCostNoThreads) {
-  const Child host(kIdle);
-  Child stubborn(kIdle);
-  ::kill(stubborn.pid(), SIGSTOP);
+  const Child host;
+  Child stubborn;
+  ::kill(stubborn.peer()->pid(), SIGSTOP);
   jobs_ = ProcessJobManager::make(registry_, 3'600'000);
   start(host, stubborn);
   constexpr int kRemovals = 10'000;
@@ -168,8 +120,8 @@ TEST_F(JobManagerTest, ManyRemovalsOfWhatDoesNotEndCostNoThreads) {
 }
 
 TEST_F(JobManagerTest, RemovalWaitsForWhatIsJustBeingStartedAndKeepsItFromRunning) {
-  const Child host(kIdle);
-  const Child instance(kIdle);
+  const Child host;
+  const Child instance;
   ASSERT_EQ(add(host), 0);
   const auto launch = begin(host);
   ASSERT_TRUE(launch);
@@ -183,24 +135,10 @@ TEST_F(JobManagerTest, RemovalWaitsForWhatIsJustBeingStartedAndKeepsItFromRunnin
   EXPECT_EQ(answer_, 0);
 }
 
-TEST_F(JobManagerTest, RecycledProcessIdOfADeadHostStillEndsItsInstances) {
-  const Child instance(kIdle);
-  Child host(kIdle);
-  start(host, instance);
-  const pid_t recycled = host.pid();
-  host.end();  // the main loop does not run: nobody has been told
-  const Child next(kIdle, recycled);
-  if (next.pid() != recycled) GTEST_SKIP() << "this user may not choose process ids";
-  EXPECT_FALSE(begin(next));
-  ASSERT_EQ(add(next), 0);
-  ASSERT_TRUE(runUntil([&] { return jobs_->instances(kIdentifier).empty(); }));
-  EXPECT_TRUE(begin(next));
-}
-
 TEST_F(JobManagerTest, RefusesWhatCannotBeLaunched) {
-  const Child host(kIdle);
+  const Child host;
   const auto refusal = [&](const std::string& executable, const Value& overlay) {
-    return jobs_->jobAddExternalService(host.identity(), executable, overlay);
+    return jobs_->jobAddExternalService(host.peer(), executable, overlay);
   };
   const Value overlay = Dictionary{{"IPCService", Dictionary{}}};
   EXPECT_EQ(refusal(bundle_, overlay), ENOEXEC);
@@ -213,27 +151,15 @@ TEST_F(JobManagerTest, RefusesWhatCannotBeLaunched) {
   EXPECT_EQ(add(host, Dictionary{{"A=B", "text"}}), EINVAL);
   EXPECT_EQ(add(host, Dictionary{{"", "text"}}), EINVAL);
   EXPECT_EQ(add(host, Dictionary{{"A", Array{}}}), EINVAL);
-  Child dead(kIdle);
-  const auto gone = dead.identity();
+  Child dead;
+  const auto gone = dead.peer();
   dead.end();
   EXPECT_EQ(jobs_->jobAddExternalService(gone, executable_, overlay), ESRCH);
 }
 
-TEST_F(JobManagerTest, EnvironmentIsTextAndTheSecondRegistrationReplacesTheFirst) {
-  const Child host(kIdle);
-  ASSERT_EQ(add(host), 0);
-  ASSERT_EQ(add(host, Dictionary{{"REAL", 1.5}, {"YES", true}, {"COUNT", 7}, {"EXTORA_IPC_FD", "9"}, {"A", "b=c"}}), 0);
-  const auto launch = begin(host);
-  ASSERT_TRUE(launch);
-  EXPECT_EQ(launch->environment,
-            (std::vector<std::string>{"A=b=c", "COUNT=7", "EXTORA_IPC_FD=3", "REAL=1.5", "YES=true"}));
-  EXPECT_EQ(launch->profile, "plugin");
-  EXPECT_EQ(launch->container, std::string("/Containers/") + kIdentifier);
-}
-
 TEST_F(JobManagerTest, BusyIsCountedAndTheInstancesOfAHostAreBounded) {
-  const Child host(kIdle);
-  const Child instance(kIdle);
+  const Child host;
+  const Child instance;
   const std::uint64_t id = start(host, instance);
   const auto assertions = ProcessAssertions::make(jobs_);
   const auto busy = [&] { return assertions->queryBusyInstances({kIdentifier}); };
@@ -245,7 +171,7 @@ TEST_F(JobManagerTest, BusyIsCountedAndTheInstancesOfAHostAreBounded) {
   EXPECT_EQ(busy().at(0)[kBusyBundleIdentifierKey].string(), kIdentifier);
   jobs_->setBusy(id, false);
   EXPECT_EQ(busy().size(), 0U);
-  EXPECT_FALSE(jobs_->instanceOf(*host.identity())) << "who shares the daemon's namespace is no instance";
+  EXPECT_FALSE(jobs_->instanceOf(*host.peer())) << "who shares the daemon's namespace is no instance";
 
   std::vector<std::uint64_t> places;
   while (const auto launch = begin(host)) places.push_back(launch->instance);

@@ -73,16 +73,6 @@ TEST_F(LauncherTest, AFailureOfBubblewrapSaysWhatItSaid) {
   EXPECT_EQ(launch({directory_.path("talks"), {"/bin/true"}}).errorNumber, EIO) << "not the first process's word";
 }
 
-TEST_F(LauncherTest, WhatIsOnItsWayWhenTheLauncherEndsIsAnswered) {
-  write("waits", "#!/bin/sh\nexec sleep 1000\n");
-  int number = 0;
-  {
-    Launcher launcher(jobs_, {directory_.path("waits"), {"/bin/true"}});
-    launcher.launch({}, [&](Launcher::Outcome outcome) { number = outcome.errorNumber; });
-  }
-  EXPECT_EQ(number, ECANCELED);
-}
-
 TEST_F(LauncherTest, ProfilesThatAreNoneAreRefused) {
   Error error;
   const auto refusal = [&](const char* content) {

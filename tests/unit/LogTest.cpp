@@ -7,7 +7,6 @@
 #include <sys/stat.h>
 
 #include <array>
-#include <thread>
 
 #include "platform/files/UniqueFd.h"
 #include "platform/log/StandardLogSink.h"
@@ -36,24 +35,6 @@ TEST(LogTest, ALineIsOneLineOfTextWhateverIsInIt) {
             "ERROR ops: a\\x0ab\\x09\\x1b[31m \\x7f \\ gr\xC3\xBC\xC3\x9F \\xc2\\x9b \\xff\\xc3\n");
   sink.write("", "-", LogLevel::Default, "");
   EXPECT_EQ(readSome(reader.get()), "DEFAULT -: \n");
-}
-
-TEST(LogTest, ATerminalGetsTimeAndProcessId) {
-  const UniqueFd terminal(::posix_openpt(O_RDWR | O_NOCTTY | O_CLOEXEC));
-  ASSERT_TRUE(terminal && ::grantpt(terminal.get()) == 0 && ::unlockpt(terminal.get()) == 0);
-  const UniqueFd screen(::open(::ptsname(terminal.get()), O_RDWR | O_NOCTTY | O_CLOEXEC));
-  StandardLogSink(screen.get(), "").write("s", "ops", LogLevel::Fault, "x");
-  const std::string line = readSome(terminal.get());
-  EXPECT_TRUE(line.ends_with(fmt::format(" {} FAULT ops: x\r\n", ::getpid()))) << line;
-  EXPECT_TRUE(line.starts_with("2")) << line;
-}
-
-TEST(LogTest, ALongMessageIsCutBetweenCharacters) {
-  const std::string whole(kMaxLogMessage, 'a');
-  EXPECT_EQ(StandardLogSink::textLine("ops", LogLevel::Info, whole), "INFO ops: " + whole);
-  const std::string cut(kMaxLogMessage - 1, 'a');
-  EXPECT_EQ(StandardLogSink::textLine("ops", LogLevel::Info, cut + "\xC3\xBC" + "b"),
-            "INFO ops: " + cut + " [3 more bytes]");
 }
 
 TEST(LogTest, TheJournalGetsFieldsWhenStandardErrorIsIts) {
@@ -103,16 +84,6 @@ TEST(LogTest, LevelsAreSetForAllAndByCategory) {
   ar->def("kept too");
   EXPECT_EQ(capture.take(),
             (std::vector<std::string>{"INFO test-ops: costly", "ERROR test-ar: kept", "DEFAULT test-ar: kept too"}));
-}
-
-TEST(LogTest, ACategoryIsMadeOnce) {
-  std::array<const Log*, 8> found{};
-  std::vector<std::thread> threads;
-  for (const Log*& log : found) threads.emplace_back([&log] { log = Log::named(kSubsystem, "test-once"); });
-  for (std::thread& thread : threads) thread.join();
-  for (const Log* log : found) EXPECT_EQ(log, found[0]);
-  EXPECT_NE(Log::named("com.example.other", "test-once"), found[0]);
-  for (const char* name : {"", "a=b", "a,b", "a b", "a\n"}) EXPECT_EQ(Log::named(kSubsystem, name), nullptr);
 }
 
 }  // namespace

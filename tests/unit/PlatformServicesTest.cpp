@@ -1,9 +1,7 @@
 // The small services that keep files below the instance's directories: preferences, notifications, containers, locale,
 // bundles, and the directories themselves.
-#include <fcntl.h>
 #include <fmt/format.h>
 #include <gtest/gtest.h>
-#include <sys/file.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 
@@ -11,7 +9,6 @@
 #include <filesystem>
 #include <fstream>
 
-#include "platform/bundle/PlatformBundle.h"
 #include "platform/container/Containers.h"
 #include "platform/files/PosixFiles.h"
 #include "platform/locale/Locale.h"
@@ -117,24 +114,6 @@ TEST_F(PlatformServicesTest, NoPostOfSeveralProcessesIsLost) {
   EXPECT_EQ(bytes, std::string("\xB0\x04\0\0\0\0\0\0", 8)) << "1,200, little-endian";
 }
 
-TEST_F(PlatformServicesTest, ADamagedOrLockedCounterStillMoves) {
-  const auto notifications = Notifications::make(directories_);
-  const std::string path = directories_.runtime + "/notify/com.example.change";
-  notifications->postNotification("com.example.change");
-  const auto inode = statusOf(path).st_ino;
-  EXPECT_EQ(notifications->counter("com.example.change"), 1U);
-  ASSERT_EQ(::truncate(path.c_str(), 3), 0);
-  EXPECT_EQ(notifications->counter("com.example.change"), 0U);
-  const UniqueFd reader(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
-  ASSERT_EQ(::flock(reader.get(), LOCK_EX), 0);
-  notifications->postNotification("com.example.change");
-  notifications->postNotification("com.example.change");
-  EXPECT_EQ(notifications->counter("com.example.change"), 2U);
-  EXPECT_EQ(statusOf(path).st_ino, inode) << "watchers keep their file";
-  notifications->postNotification("../outside");
-  EXPECT_FALSE(fs::exists(directories_.runtime + "/outside"));
-}
-
 TEST_F(PlatformServicesTest, ContainersBelongToThoseTheyAreFor) {
   directories_.plugInUser = "12345";
   const auto containers = Containers::make(directories_, Files::make());
@@ -164,14 +143,6 @@ TEST_F(PlatformServicesTest, ContainersBelongToThoseTheyAreFor) {
     EXPECT_EQ(containers->containerCreateOrLookup(kPlugInContainerClass, bad, 0).index(), 1U) << bad;
   }
   EXPECT_EQ(std::get<1>(containers->containerCreateOrLookup(kDaemonContainerClass, "a@2", 0)), std::uint64_t{EINVAL});
-}
-
-TEST_F(PlatformServicesTest, AContainerThatCannotBeMadeAnswersTheErrorNumber) {
-  struct FullDisk : PosixFiles {
-    std::optional<Error> createDirectory(const std::string&, bool, unsigned) override { return posixError(ENOSPC, ""); }
-  };
-  const auto containers = Containers::make(directories_, std::make_shared<FullDisk>());
-  EXPECT_EQ(std::get<1>(containers->containerCreateOrLookup(10, "com.example", 1)), std::uint64_t{ENOSPC});
 }
 
 TEST_F(PlatformServicesTest, TheLocaleFollowsItsFileHoweverItChanges) {
@@ -224,38 +195,6 @@ TEST(LocaleTest, CandidatesAreTheLocaleAndItsLanguage) {
       {"../x_y", {}},
   };
   for (const auto& [lang, candidates] : cases) EXPECT_EQ(localizationCandidates(lang), candidates) << lang;
-}
-
-TEST_F(PlatformServicesTest, ABundleIsTheNearestFolderWithAnInfoPlist) {
-  const std::string app = directory_.path("Mail.app");
-  const std::string plugIn = app + "/PlugIns/Filter.appex";
-  fs::create_directories(plugIn + "/bin");
-  fs::create_directories(app + "/Helpers");
-  write(app + "/Info.plist", propertyList("<dict><key>HBBundleExecutable</key><string>bin/../mail</string></dict>"));
-  write(plugIn + "/Info.plist", "damaged");
-  const auto ofExecutable = [](const std::string& path) {
-    return PlatformBundle::create(path, PlatformBundle::PathKind::Executable);
-  };
-  using Property = PlatformBundle::Property;
-  EXPECT_EQ(ofExecutable(app + "/Helpers/tool")->property(Property::BundlePath), app);
-  EXPECT_EQ(ofExecutable(app + "/Helpers/tool")->property(Property::ExecutablePath), app + "/bin/../mail");
-  const auto damaged = ofExecutable(plugIn + "/bin/filter");
-  EXPECT_EQ(damaged->property(Property::SupportPath), plugIn);
-  EXPECT_EQ(damaged->property(Property::ExecutablePath), std::nullopt);
-  EXPECT_TRUE(damaged->info().isNothing());
-  const auto none = ofExecutable(directory_.path("tool"));
-  EXPECT_EQ(none->property(Property::BundlePath), std::nullopt);
-  EXPECT_EQ(none->describe(), "<no bundle at " + directory_.path("tool") + ">");
-
-  for (const char* outside : {"../other", "/../../etc/passwd", ".", "link"}) {
-    if (!fs::exists(fs::symlink_status(plugIn + "/link"))) fs::create_symlink("/bin/cat", plugIn + "/link");
-    write(plugIn + "/Info.plist",
-          propertyList(fmt::format("<dict><key>HBBundleExecutable</key><string>{}</string></dict>", outside)));
-    EXPECT_TRUE(damaged->info().isNothing() || std::string_view(outside) != "../other") << "remembered";
-    damaged->dropCaches();
-    EXPECT_TRUE(damaged->info().isDictionary());
-    EXPECT_EQ(damaged->property(Property::ExecutablePath), std::nullopt) << outside;
-  }
 }
 
 TEST_F(PlatformServicesTest, DirectoriesComeFromTheEnvironment) {

@@ -66,15 +66,5 @@ TEST(Probes, AllAreInTheProgramWithTheirArguments) {
                                           "xtd:XTARInitialization__end"}));
 }
 
-TEST(Probes, AreEnabledWhileATracerCounts) {
-  EXPECT_FALSE(probes::requestInputEnabled());
-  ++xtd_request__input_semaphore;
-  EXPECT_TRUE(probes::requestInputEnabled());
-  EXPECT_FALSE(probes::requestOutputEnabled());
-  probes::requestInput(1, "x");
-  --xtd_request__input_semaphore;
-  EXPECT_FALSE(probes::requestInputEnabled());
-}
-
 }  // namespace
 }  // namespace extora

@@ -20,50 +20,6 @@ RegistrationPtr registration(const std::string& path, const Dictionary& info, co
   return bundle;
 }
 
-RegisteredGroupPtr group(const std::string& application, std::vector<std::string> plugIns,
-                         const Dictionary& applicationInfo = {}) {
-  std::vector<RegistrationPtr> registrations;
-  for (const std::string& name : plugIns) {
-    registrations.push_back(registration(application + "/PlugIns/" + name, {{"HBBundleIdentifier", name}}));
-  }
-  const std::vector<std::string> containers(registrations.size());
-  return RegisteredGroup::make(registration(application, applicationInfo), registrations, containers, {});
-}
-
-std::vector<std::string> names(const PlugInRecords& records) {
-  std::vector<std::string> all;
-  for (const PlugInRecord& record : records) all.push_back(record->plugInIdentifier);
-  return all;
-}
-
-using Names = std::vector<std::string>;
-
-TEST(RegistrySnapshotTest, AChangeSharesWhatStaysAndLeavesTheOldSnapshotAsItWas) {
-  const SnapshotPtr empty = std::make_shared<const RegistrySnapshot>();
-  const SnapshotPtr first = empty->changed({group("/b.app", {"b1", "b2"}), group("/a.app", {"a1"})}, {});
-  EXPECT_EQ(names(first->plugIns()), (Names{"a1", "b1", "b2"}));
-  const PlugInRecord kept = first->plugIns()[1];
-  const PlugInRecord lost = first->plugIns()[0];
-
-  const SnapshotPtr second = first->changed({group("/a.app", {"a2"}), group("/c.app", {})}, {"/missing.app"});
-  EXPECT_EQ(names(second->plugIns()), (Names{"a2", "b1", "b2"}));
-  EXPECT_EQ(second->plugInByUUID(*kept->plugInUUID), kept);
-  EXPECT_EQ(second->plugInAt("/b.app/PlugIns/b1"), kept);
-  EXPECT_EQ(second->plugInByUUID(*lost->plugInUUID), nullptr);
-  EXPECT_EQ(second->plugInAt("/a.app/PlugIns/a1"), nullptr);
-  ASSERT_NE(second->applicationAt("/c.app"), nullptr);
-  EXPECT_EQ(second->applicationAt("/c.app")->plugIns.size(), 0U);
-  EXPECT_EQ(containingApplicationOf(kept), second->applicationAt("/b.app"));
-  EXPECT_NE(first->knowledge(), second->knowledge());
-
-  EXPECT_EQ(names(first->plugIns()), (Names{"a1", "b1", "b2"}));
-  EXPECT_EQ(first->plugInByUUID(*lost->plugInUUID), lost);
-  const SnapshotPtr third = second->changed({}, {"/a.app", "/b.app", "/c.app"});
-  EXPECT_TRUE(third->plugIns().empty());
-  EXPECT_TRUE(third->groups().empty());
-  EXPECT_EQ(lost->containingApplication->bundleURL->path(), "/a.app") << "a record keeps its application";
-}
-
 // The rules as the daemon applies them, written as plainly as possible.
 namespace oracle {
 
@@ -214,25 +170,6 @@ TEST_F(QueryIndexTest, NoRecordThatTheRulesAcceptIsEverLost) {
   }
   EXPECT_GT(accepted, 10'000U);
   EXPECT_GT(narrowed, 10'000U);
-}
-
-TEST_F(QueryIndexTest, EqualityRulesFindExactlyWhatTheyAcceptAndOthersNarrowNothing) {
-  const SnapshotPtr snapshot = randomSnapshot();
-  const std::size_t all = snapshot->plugIns().size();
-  for (const char* each : kTexts) {
-    const Value rules = Dictionary{{"Kind", std::string("=") + each}};
-    std::size_t accepted = 0;
-    for (const PlugInRecord& record : snapshot->plugIns()) accepted += oracle::matches(*record, rules) ? 1 : 0;
-    EXPECT_EQ(snapshot->candidates(rules).size(), accepted) << each;
-  }
-  const Value others[] = {Value(),
-                          Dictionary{},
-                          Dictionary{{"Kind", "<>a"}},
-                          Dictionary{{"Kind", true}},
-                          Dictionary{{"Kind", Array{Value("a"), Value(">b")}}},
-                          Dictionary{{"HXUserElection", "1"}}};
-  for (const Value& rules : others) EXPECT_EQ(snapshot->candidates(rules).size(), all) << rules.describe();
-  EXPECT_TRUE(snapshot->candidates(Dictionary{{"Nowhere", "a"}}).empty());
 }
 
 TEST_F(QueryIndexTest, KeepsTheMostUsedKeysAndUsesFewRulesOfOneQuery) {

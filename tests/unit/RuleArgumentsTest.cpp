@@ -6,20 +6,7 @@ namespace {
 
 using platform::Array;
 using platform::Dictionary;
-using tools::ruleFault;
 using tools::rulesFromArguments;
-
-TEST(RuleArgumentsTest, TheFirstEqualsSignEndsTheKey) {
-  std::string fault;
-  const Dictionary expected{{"A", "=1"}, {"B", ">=1.9"}, {"C", ""}, {"D", true}, {"E", false}, {"F", "=true"}};
-  EXPECT_EQ(rulesFromArguments({"A==1", "B=>=1.9", "C=", "D=true", "E=false", "F==true"}, {}, fault), expected);
-  EXPECT_EQ(fault, "");
-
-  EXPECT_EQ(ruleFault("A=1"), "");
-  EXPECT_NE(ruleFault("A"), "");
-  EXPECT_NE(ruleFault("=1"), "");
-  EXPECT_NE(ruleFault("A=\xff"), "");
-}
 
 TEST(RuleArgumentsTest, AKeyGivenAgainAddsAnAlternativeAndReplacesTheFiles) {
   std::string fault;

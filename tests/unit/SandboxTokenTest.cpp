@@ -187,20 +187,5 @@ TEST_F(SandboxTokenTest, ReplacedPlaceIsStale) {
   EXPECT_TRUE(open(*token)) << "the very one is back";
 }
 
-TEST_F(SandboxTokenTest, AFileThatGotTheInodeOfTheFirstIsStale) {
-  const std::string place = bundle_ + "/images/cat";
-  struct stat before {};
-  ASSERT_EQ(::stat(place.c_str(), &before), 0);
-  const auto token = issue(place);
-  struct stat after {};
-  for (int attempt = 0; attempt < 50 && after.st_ino != before.st_ino; ++attempt) {
-    fs::remove(place);
-    write(place, "other");
-    ASSERT_EQ(::stat(place.c_str(), &after), 0);
-  }
-  EXPECT_FALSE(open(*token));
-  EXPECT_EQ(error_, ESTALE);
-}
-
 }  // namespace
 }  // namespace platform

@@ -3,7 +3,6 @@
 #include <gtest/gtest.h>
 
 #include <future>
-#include <memory>
 #include <numeric>
 #include <optional>
 #include <stdexcept>
@@ -13,26 +12,9 @@
 #include "platform/queue/DeferredWork.h"
 #include "platform/queue/Group.h"
 #include "platform/value/InternalInconsistency.h"
-#include "tests/support/Eventually.h"
 
 namespace platform {
 namespace {
-
-TEST(SerialQueueTest, AsynchronousAndSynchronousCallersOfManyThreadsExcludeEachOther) {
-  const SerialQueue queue("shared");
-  std::size_t count = 0;
-  std::vector<std::thread> threads;
-  for (int t = 0; t < 8; ++t) {
-    threads.emplace_back([&] {
-      for (int i = 0; i < 500; ++i) {
-        queue.async([&] { ++count; });
-        queue.sync([&] { ++count; });
-      }
-    });
-  }
-  for (std::thread& thread : threads) thread.join();
-  EXPECT_EQ(queue.sync([&] { return count; }), 8000U);
-}
 
 TEST(SerialQueueTest, SyncRunsOnTheCallingThreadAndKnowsWhichQueuesAreCurrent) {
   const SerialQueue outer("outer");
@@ -56,50 +38,6 @@ TEST(SerialQueueTest, SyncRunsOnTheCallingThreadAndKnowsWhichQueuesAreCurrent) {
   // An exception leaves the queue usable.
   EXPECT_THROW(outer.sync([] { throw std::runtime_error("work"); }), std::runtime_error);
   EXPECT_EQ(outer.sync([] { return 7; }), 7);
-}
-
-TEST(SerialQueueTest, WorkOfADestroyedQueueStillRuns) {
-  std::promise<void> started;
-  std::promise<void> release;
-  tests::Recorder<int> seen;
-  QueueReference reference;
-  {
-    const SerialQueue queue("short-lived");
-    reference = QueueReference(queue);
-    queue.async([&] {
-      started.set_value();
-      release.get_future().wait();
-    });
-    for (int i = 0; i < 3; ++i) {
-      queue.async([&seen, i] { seen.add(i); });
-    }
-    started.get_future().wait();
-  }
-  reference.async([&] { seen.add(3); });
-  release.set_value();
-  EXPECT_EQ(seen.waitFor(4), (std::vector<int>{0, 1, 2, 3}));
-}
-
-TEST(SerialQueueTest, ManyBlockedQueuesDoNotStarveEachOther) {
-  constexpr std::size_t kQueues = 40;
-  std::vector<std::unique_ptr<SerialQueue>> queues;
-  Group done;
-  Group gate;
-  gate.enter();
-  for (std::size_t i = 0; i < kQueues; ++i) {
-    queues.push_back(std::make_unique<SerialQueue>("blocked"));
-    done.enter();
-    queues.back()->async([&] {
-      gate.wait();
-      done.leave();
-    });
-  }
-  const SerialQueue free("free");
-  std::promise<void> ran;
-  free.async([&] { ran.set_value(); });
-  ran.get_future().wait();
-  gate.leave();
-  done.wait();
 }
 
 using SerialQueueDeathTest = testing::Test;
@@ -204,15 +142,6 @@ TEST_F(DeferredWorkTest, GoesToAnotherThreadWhenAnybodyElseNeedsTheQueueOrTheHan
   done.get_future().wait();
   scope_.closeAndDrain();
   queue_.sync([&] { expectRunElsewhere(); });
-}
-
-TEST(GroupTest, LeavingMoreOftenThanEnteringIsABrokenContract) {
-  Group group;
-  group.wait();
-  group.enter(2);
-  group.leave();
-  group.leave();
-  EXPECT_THROW(group.leave(), InternalInconsistency);
 }
 
 }  // namespace

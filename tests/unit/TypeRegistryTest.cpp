@@ -68,30 +68,5 @@ TEST_F(TypeRegistryTest, ARuleAcceptsWhenEveryItemConformsAndNoTypeIsMetTooOften
   EXPECT_TRUE(types_.evaluateActivationRule(Dictionary{{"image", ~std::uint64_t{0}}}, items({{"png"}, {"png"}})));
 }
 
-TEST_F(TypeRegistryTest, TrueAcceptsAnythingAndAnythingElseNothing) {
-  EXPECT_TRUE(types_.evaluateActivationRule(true, items({})));
-  EXPECT_TRUE(types_.evaluateActivationRule(true, Value()));
-  const Value some = items({{"png"}});
-  const Value malformed[] = {false,
-                             0,
-                             2,
-                             "image",
-                             Value(),
-                             Array{Value("image")},
-                             Dictionary{},
-                             Dictionary{{"image", "2"}},
-                             Dictionary{{"image", 2}, {"text", "many"}}};
-  for (const Value& rule : malformed) EXPECT_FALSE(types_.evaluateActivationRule(rule, some)) << rule.describe();
-  const Value noItems[] = {Value(),
-                           "text",
-                           Dictionary{{"items", "text"}},
-                           Dictionary{{"items", Array{Value(1)}}},
-                           Dictionary{{"items", Array{Value(Dictionary{{"types", "image"}})}}},
-                           Dictionary{{"items", Array{Value(Dictionary{{"types", Array{Value(1)}}})}}}};
-  for (const Value& each : noItems) {
-    EXPECT_FALSE(types_.evaluateActivationRule(Dictionary{{"image", 9}}, each)) << each.describe();
-  }
-}
-
 }  // namespace
 }  // namespace platform

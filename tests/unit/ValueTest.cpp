@@ -1,12 +1,9 @@
 #include "platform/value/Value.h"
 
-#include <fcntl.h>
 #include <gtest/gtest.h>
-#include <unistd.h>
 
 #include <limits>
 
-#include "platform/files/UniqueFd.h"
 #include "platform/value/InternalInconsistency.h"
 #include "platform/value/PropertyListKinds.h"
 #include "tests/support/PrintDescribed.h"
@@ -20,21 +17,6 @@ constexpr std::int64_t kLeast = std::numeric_limits<std::int64_t>::min();
 constexpr std::int64_t kMost = std::numeric_limits<std::int64_t>::max();
 const double kNan = std::numeric_limits<double>::quiet_NaN();
 const double kInfinity = std::numeric_limits<double>::infinity();
-
-TEST(ValueTest, ReadsOfAnotherKindAnswerNothing) {
-  const Value text("text");
-  EXPECT_FALSE(text.exactBoolean());
-  EXPECT_EQ(text.integerValue(), 0);
-  EXPECT_EQ(text.realValue(), 0);
-  EXPECT_TRUE(text["key"]["deeper"].isNothing());
-  EXPECT_TRUE(text.at(0).isNothing());
-  EXPECT_EQ(text.size(), 0U);
-  EXPECT_TRUE(text.bytes().empty());
-  EXPECT_EQ(text.uuid(), Uuid());
-  EXPECT_EQ(text.descriptor(), -1);
-  EXPECT_EQ(Value(7).string(), "");
-  EXPECT_TRUE((Array{1})[1].isNothing());
-}
 
 TEST(ValueTest, ExactReadsTakeOneKindAndNumericReadsAnyNumber) {
   EXPECT_EQ(Value(3).exactUnsigned(), 0U);
@@ -77,20 +59,6 @@ TEST(ValueTest, NumbersAreEqualByExactValueWhateverTheirKind) {
   EXPECT_NE(Value(kInfinity), Value(kMost));
 }
 
-TEST(ValueTest, OtherKindsAreEqualByKindAndContent) {
-  EXPECT_EQ(Value(), Value());
-  EXPECT_NE(Value(), Value(false));
-  EXPECT_NE(Value("1"), Value(1));
-  EXPECT_NE(Value::data({1, 2}), Value::message({1, 2}));
-  EXPECT_NE(Value(Date{1, 0}), Value(Date{1, 1}));
-  EXPECT_NE(Value(Date{1, 0}), Value(1));
-  const Uuid uuid = Uuid::random();
-  EXPECT_NE(Value(uuid), Value(uuid.text()));
-  EXPECT_NE(Value(Array()), Value(Dictionary()));
-  EXPECT_EQ((Dictionary{{"b", 2}, {"a", 1}}), (Dictionary{{"a", 1U}, {"b", 2.0}}));
-  EXPECT_NE((Dictionary{{"a", 1}}), (Dictionary{{"a", 1}, {"b", 2}}));
-}
-
 TEST(ValueTest, DictionariesStaySortedAndKeepNoNothing) {
   Dictionary dictionary{{"b", 1}, {"a", 2}, {"gone", Value()}, {"b", 3}};
   EXPECT_EQ(dictionary.size(), 2U);
@@ -128,21 +96,6 @@ TEST(ValueTest, AWriteNeverReachesWhoeverSharesTheNode) {
   for (int i = 0; i < 100; ++i) list.append(list[0]);
   EXPECT_EQ(list[102], Value("first"));
   EXPECT_THROW(list.set(103, 0), InternalInconsistency);
-}
-
-TEST(ValueTest, ADescriptorLivesAsLongAsItsLastValue) {
-  int ends[2];
-  ASSERT_EQ(pipe2(ends, O_CLOEXEC), 0);
-  const UniqueFd reader(ends[0]);
-  Value value = Value::descriptor(UniqueFd(ends[1]));
-  Value copy = value;
-  EXPECT_EQ(copy.descriptor(), ends[1]);
-  value = Value();
-  ASSERT_EQ(write(copy.descriptor(), "x", 1), 1);
-  copy = Value();
-  char bytes[2];
-  EXPECT_EQ(read(reader.get(), bytes, sizeof bytes), 1);
-  EXPECT_EQ(read(reader.get(), bytes, sizeof bytes), 0) << "the write end is still open";
 }
 
 TEST(ValueTest, PropertyListKindsAreWhatAFileGivesBack) {

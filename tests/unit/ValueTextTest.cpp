@@ -1,12 +1,10 @@
 // Values as text: descriptions, errors, UUIDs, URLs, dates, the numeric order.
 #include <gtest/gtest.h>
 
-#include <cerrno>
 #include <unordered_set>
 
 #include "platform/value/DateText.h"
 #include "platform/value/Describe.h"
-#include "platform/value/Error.h"
 #include "platform/value/NumericOrder.h"
 #include "platform/value/Url.h"
 #include "platform/value/Utf8.h"
@@ -32,26 +30,6 @@ TEST(ValueTextTest, EveryKindDescribesItselfOnOneLine) {
             R"(m: <message 3 bytes>, t: 2026-11-22T20:00:00.5Z, u: 8C0A1B2C-3D4E-4F60-8182-93A4B5C6D7E8})");
   EXPECT_EQ(fmt::format("{}|{}|{}", Value("plain \"text\""), Value(), uuid),
             "plain \"text\"|(null)|8C0A1B2C-3D4E-4F60-8182-93A4B5C6D7E8");
-}
-
-TEST(ValueTextTest, ALongDescriptionIsCutBetweenCharacters) {
-  std::string text = "x";
-  while (text.size() < (1U << 20)) text += "\xC3\xA9";
-  for (const Value& value : {Value(text), Value(Array{text, text}), Value(Dictionary{{text, text}})}) {
-    const std::string described = value.describe();
-    EXPECT_GT(described.size(), 65'000U);
-    EXPECT_LT(described.size(), 65'600U);
-    EXPECT_TRUE(described.ends_with("\xC3\xA9..."));
-    EXPECT_TRUE(isUtf8(described));
-  }
-}
-
-TEST(ValueTextTest, ErrorsPrintDomainCodeAndDescription) {
-  EXPECT_EQ((Error{"D", 7, "text"}).describe(), "D 7: text");
-  EXPECT_EQ((Error{"D", -7, std::nullopt}).describe(), "D -7");
-  EXPECT_EQ((Error{"D", 7, std::nullopt}).localizedDescription(), "The operation could not be completed (D 7)");
-  EXPECT_EQ(posixError(ENOENT, "open a").describe(), "POSIX 2: open a: No such file or directory");
-  EXPECT_EQ(posixError(9999, "").describe(), "POSIX 9999: Unknown error 9999");
 }
 
 TEST(ValueTextTest, UuidsAreReadInEitherCaseAndWrittenInUpperCase) {
@@ -94,15 +72,6 @@ TEST(ValueTextTest, FileUrlsNameAPath) {
                            "file:///a%2", "file:///a%GG", "file:///a%00", "file:///%FF", "file://localhost"}) {
     EXPECT_EQ(Url::parse(text), std::nullopt) << text;
   }
-}
-
-TEST(ValueTextTest, UrlsAreMadeOfPathsAndExtended) {
-  EXPECT_EQ(Url::file("/a b/\xC3\xBC;?/").absoluteString(), "file:///a%20b/%C3%BC;%3F");
-  EXPECT_EQ(Url::file("/").absoluteString(), "file:///");
-  EXPECT_EQ(Url::file("/").appending("a").appending("/b/c/").path(), "/a/b/c");
-  EXPECT_EQ(Url::file("/a").appending("").path(), "/a");
-  EXPECT_EQ(Url::file("/a/b.app/").lastComponent(), "b.app");
-  EXPECT_EQ(Url::file("/").lastComponent(), "/");
 }
 
 TEST(ValueTextTest, DatesAreReadAndWrittenToTheSecond) {

@@ -23,7 +23,6 @@
 namespace extora {
 namespace {
 
-using platform::Date;
 using Lines = std::vector<std::string>;
 
 constexpr const char* kOldFile =
@@ -116,23 +115,6 @@ TEST_F(XTDAnnotationStoreTest, AFirstStartIsSilentAndMakesTheFileWithTheFirstCha
   EXPECT_EQ(open()->annotations(), store->annotations());
 }
 
-TEST_F(XTDAnnotationStoreTest, MergesOneLevelDeepAndKeepsWhatTheFileCanHold) {
-  write(path_, kOldFile);
-  auto store = open();
-  EXPECT_EQ(store->annotations(), kOldMap);
-  const Uuid uuid = Uuid::random();
-  store->setAnnotation(Dictionary{{"extension", Dictionary{{"a", 1}, {"b", 2}}}}, *plugIn_);
-  store->setAnnotation(Dictionary{{"election", 2U},
-                                  {"extension", Dictionary{{"id", uuid}, {"when", Date{5, 7}}, {"nan", std::nan("")}}}},
-                       *plugIn_);
-  const Value expected = Dictionary{
-      {"election", 2}, {"extension", Dictionary{{"id", uuid.text()}, {"when", Date{5, 0}}}}, {"other", "kept"}};
-  EXPECT_EQ(store->annotationForIdentifier("com.a"), expected);
-  EXPECT_EQ(store->annotationForPlugIn(*plugIn_), open()->annotationForPlugIn(*plugIn_));
-  store->setAnnotation(Value(), *plugIn_);
-  EXPECT_TRUE(open()->annotations().empty());
-}
-
 TEST_F(XTDAnnotationStoreTest, AnotherVersionIsResetAndKeptOnceBesideTheFile) {
   std::string other = kOldFile;
   other.replace(other.find("16"), 2, "15");
@@ -150,18 +132,6 @@ TEST_F(XTDAnnotationStoreTest, AnotherVersionIsResetAndKeptOnceBesideTheFile) {
   write(path_, "later damage");
   open()->setAnnotation(Dictionary{{"election", 5}}, *plugIn_);
   EXPECT_EQ(read(path_ + ".damaged"), other) << "once: the first one stays";
-}
-
-TEST_F(XTDAnnotationStoreTest, AFileWithoutAMapLoadsEmpty) {
-  const char* texts[] = {"<plist version=\"1.0\"><dict><key>version</key><integer>16</integer></dict></plist>",
-                         "<plist version=\"1.0\"><dict><key>version</key><integer>16</integer><key>data</key><array/>"
-                         "</dict></plist>"};
-  tests::LogCapture log;
-  for (const char* text : texts) {
-    write(path_, text);
-    EXPECT_TRUE(open()->annotations().empty());
-  }
-  EXPECT_EQ(log.take(), Lines());
 }
 
 // What loads is the old content or nothing, whatever became of the file; and the store works on afterwards.

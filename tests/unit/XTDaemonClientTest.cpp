@@ -2,10 +2,7 @@
 
 #include <gtest/gtest.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 
-#include <cstdlib>
-#include <filesystem>
 #include <future>
 #include <thread>
 
@@ -66,12 +63,6 @@ class Peer {
     const auto head = header.serialize();
     std::copy(head.begin(), head.end(), bytes.begin());
     EXPECT_EQ(::send(fd_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL), static_cast<ssize_t>(bytes.size()));
-  }
-  void close() { fd_.reset(); }
-  // Whether the other side closes the connection in time, sending nothing before.
-  bool atEnd() {
-    char byte = 0;
-    return ::recv(fd_.get(), &byte, 1, 0) == 0;
   }
 
  private:
@@ -208,57 +199,6 @@ TEST_F(XTDaemonClientTest, TrafficIsLoggedAtDebugLevelWithoutWholeTokens) {
   EXPECT_EQ(log.take(), (std::vector<std::string>{
                             "DEBUG traffic: request: {flags: 0, paths: [], request: \"access\", uuids: [], version: 3}",
                             "DEBUG traffic: reply: {extensions: [\"01234567...\", \"short\"]}"}));
-}
-
-TEST_F(XTDaemonClientTest, ALostConnectionIsCode4ForEveryRequest) {
-  client_->bulkPlugins(0, keep());
-  (void)peer_->read();
-  client_.reset();  // an outstanding request outlives its client
-  peer_->close();
-  const IpcReplyObject lost = kept();
-  ASSERT_TRUE(lost.error.has_value());
-  EXPECT_EQ(XTDaemonClient::errorInReply(lost), makeError(4, lost.error->text));
-  EXPECT_TRUE(onQueue_);
-}
-
-// A runtime directory of its own, with or without somebody listening.
-class XTDaemonClientService : public testing::Test {
- protected:
-  void SetUp() override {
-    std::string name = testing::TempDir() + "extora-runtimeXXXXXX";
-    ASSERT_NE(mkdtemp(name.data()), nullptr);
-    runtime_ = name;
-    std::filesystem::create_directories(runtime_ + "/services");
-    setenv("EXTORA_RUNTIME_DIR", runtime_.c_str(), 1);
-  }
-  void TearDown() override {
-    unsetenv("EXTORA_RUNTIME_DIR");
-    std::filesystem::remove_all(runtime_);
-  }
-  std::string runtime_;
-  tests::LogCapture log_;
-};
-
-TEST_F(XTDaemonClientService, AReleasedClientGetsItsReplyAndThenClosesTheConnection) {
-  sockaddr_un address{};
-  address.sun_family = AF_UNIX;
-  const std::string path = runtime_ + "/services/com.example.somebody";
-  path.copy(address.sun_path, sizeof address.sun_path - 1);
-  const platform::UniqueFd listener(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-  ASSERT_EQ(::bind(listener.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
-  ASSERT_EQ(::listen(listener.get(), 1), 0);
-
-  auto client = XTDaemonClient::initWithServiceName("com.example.somebody");
-  Peer peer(::accept4(listener.get(), nullptr, nullptr, SOCK_CLOEXEC));
-  std::promise<Value> replied;
-  client->bulkPlugins(0, [&replied](const IpcReplyObject& reply) { replied.set_value(reply.body); });
-  client.reset();
-  peer.reply(peer.read().header.id, {{"late", true}});
-  auto reply = replied.get_future();
-  ASSERT_EQ(reply.wait_for(kDeadline), std::future_status::ready);
-  EXPECT_EQ(reply.get(), Value(Dictionary{{"late", true}}));
-  EXPECT_TRUE(peer.atEnd());
-  EXPECT_EQ(log_.take(), std::vector<std::string>{});
 }
 
 TEST(XTDaemonClient, ErrorsInReplies) {

@@ -85,26 +85,6 @@ TEST_F(XTDatabaseTest, ALocaleChangeFlushesEverything) {
   EXPECT_NE(database_->findPlugIn(before->uuid()), before);
 }
 
-TEST_F(XTDatabaseTest, LookUpsShareOneObject) {
-  const auto plugIn = install(sampleRecord("com.a"));
-  EXPECT_EQ(database_->findPlugInAtPath(plugIn->url()), plugIn);
-  EXPECT_EQ(database_->plugInsWithinApplication(Url::file("/Apps/com.a.app")).value(), XTDatabase::PlugIns{plugIn});
-  EXPECT_EQ(database_->findPlugIns(Dictionary{{"x", "y"}}).value(), XTDatabase::PlugIns{plugIn});
-  EXPECT_EQ(registry_.lastQuery, Value(Dictionary{{"x", "y"}}));
-
-  tests::LogCapture log("info");
-  const Uuid unknown = Uuid::random();
-  EXPECT_FALSE(database_->findPlugIn(unknown));
-  EXPECT_FALSE(database_->findPlugInAtPath(Url::file("/nowhere")));
-  EXPECT_FALSE(database_->plugInsWithinApplication(Url::file("/nowhere")));
-  registry_.install(application("/Apps/Empty.app", false), {});
-  EXPECT_FALSE(database_->plugInsWithinApplication(Url::file("/Apps/Empty.app")));
-  EXPECT_EQ(log.take(), Lines({"INFO ops: AppRegistry cannot find plug-in with UUID:" + unknown.text(),
-                               "INFO ops: AppRegistry cannot find plug-in at path:/nowhere"}));
-  registry_.silent = true;
-  EXPECT_FALSE(database_->findPlugIns(Dictionary{{"x", "y"}}));
-}
-
 TEST_F(XTDatabaseTest, LeavesOutWhatCannotBeUsed) {
   registry_.install(sampleRecord("com.good"));
   ARExtoraProxy noURL = sampleRecord("com.nourl");
@@ -185,41 +165,11 @@ TEST_F(XTDatabaseTest, ElectionFilters) {
   }
 }
 
-class Receiver : public XTDatabaseDelegate {
- public:
-  explicit Receiver(XTDatabase& database) : database_(database) {}
-  void removedPlugIns(const platform::PlugInRecords& records) override {
-    removed = records;
-    countWhenTold = database_.cacheCount();
-    onQueue = database_._sync().isCurrent();
-  }
-  platform::PlugInRecords removed;
-  std::size_t countWhenTold = 99;
-  bool onQueue = true;
-
- private:
-  XTDatabase& database_;
-};
-
-TEST_F(XTDatabaseTest, AnUninstallEmptiesTheCacheBeforeTheDelegateHears) {
-  const auto receiver = std::make_shared<Receiver>(*database_);
-  database_->setDelegate(receiver);
-  const ARExtoraProxy record = sampleRecord("com.a");
-  const PlugInRecord held = registry_.install(record);
-  const auto plugIn = database_->plugInForProxy(held);
-  database_->setAnnotation(Dictionary{{"election", 2}}, *plugIn);
-
-  tests::LogCapture log;
-  database_->pluginsDidInstall({held});
-  registry_.uninstall(plugIn->uuid(), true);
-  const std::string what = "com.a com.a(7.1) " + plugIn->uuid().text() + " /Apps/com.a.app/PlugIns/com.a.appex";
-  EXPECT_EQ(log.take(), Lines({"DEFAULT ops: plug-in INSTALLED:" + what, "DEFAULT ops: plug-in UNINSTALLED:" + what}));
-  EXPECT_EQ(receiver->removed, platform::PlugInRecords{held});
-  EXPECT_EQ(receiver->countWhenTold, 0U);
-  EXPECT_FALSE(receiver->onQueue);
-  EXPECT_EQ(database_->annotationForPlugIn(*plugIn), Value(Dictionary{{"election", 2}}));
-
-  // A record that a query handed out before the uninstall must not bring the plug-in back.
+TEST_F(XTDatabaseTest, ARecordFromBeforeAnUninstallDoesNotBringThePlugInBack) {
+  const PlugInRecord held = registry_.install(sampleRecord("com.a"));
+  ASSERT_TRUE(database_->plugInForProxy(held));
+  registry_.uninstall(*held->plugInUUID, true);
+  EXPECT_EQ(database_->cacheCount(), 0U);
   EXPECT_FALSE(database_->plugInForProxy(held));
   EXPECT_EQ(database_->cacheCount(), 0U);
 }

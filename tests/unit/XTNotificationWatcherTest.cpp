@@ -1,11 +1,9 @@
 #include "Extora/XTNotificationWatcher.h"
 
 #include <gtest/gtest.h>
-#include <poll.h>
 
 #include <cstdlib>
 #include <filesystem>
-#include <thread>
 
 #include "tests/support/TestPlatform.h"
 
@@ -32,28 +30,6 @@ class XTNotificationWatcherTest : public testing::Test {
   platform::Directories directories_;
   std::shared_ptr<platform::Notifications> notifications_;
 };
-
-TEST_F(XTNotificationWatcherTest, CountsEveryPostOnce) {
-  post(3);
-  const auto watcher = XTNotificationWatcher::initWithName(kName);
-  ASSERT_NE(watcher, nullptr);
-  EXPECT_EQ(watcher->take(), 0U) << "what came before is not news";
-  std::thread poster([this] { post(5); });
-  std::uint64_t posts = 0;
-  while (posts < 5) {
-    const auto more = watcher->wait(kDeadline);
-    ASSERT_NE(more, 0U);
-    posts += more;
-  }
-  poster.join();
-  EXPECT_EQ(posts, 5U);
-  EXPECT_EQ(watcher->wait(std::chrono::milliseconds(1)), 0U);
-  post();
-  struct pollfd entry = {watcher->descriptor(), POLLIN, 0};
-  EXPECT_EQ(::poll(&entry, 1, 30'000), 1);
-  EXPECT_EQ(watcher->take(), 1U);
-  EXPECT_EQ(XTNotificationWatcher::initWithName("no/name"), nullptr);
-}
 
 TEST_F(XTNotificationWatcherTest, FollowsANotificationThatComesGoesAndIsMadeAnew) {
   const auto watcher = XTNotificationWatcher::initWithName(kName);

@@ -23,56 +23,6 @@ std::shared_ptr<XTPlugInCore> record(const Value& info, const Url& url = kFilter
   return XTPlugInCore::initWithName("com.example.filter", url, info, {}, std::nullopt);
 }
 
-TEST(XTPlugInCore, SetupFailuresAndTheirLines) {
-  tests::LogCapture log;
-  EXPECT_EQ(XTPlugInCore::initWithName("com.example.filter", std::nullopt, {}, {}, std::nullopt), nullptr);
-  EXPECT_EQ(log.take(), Lines{});
-
-  EXPECT_EQ(XTPlugInCore::initWithName(std::nullopt, kPlain, {}, {}, std::nullopt), nullptr);
-  EXPECT_EQ(log.take(), Lines{"ERROR ops: missing identifier in plug-in at /System/PlugIns/Filter.plugin"});
-
-  XTPlugInCore partly;
-  const Dictionary old = infoWith({{"Kept", true}});
-  ASSERT_TRUE(partly.setDictionaries(old));
-  EXPECT_FALSE(partly.setupWithName("com.example.filter", Url::file("/System/PlugIns/My Filter.plugin"),
-                                    Dictionary{{"HXExtension", Array{}}}, {}, std::nullopt));
-  EXPECT_EQ(log.take(), Lines{"DEFAULT ops: malformed plug-in dictionary in plug-in com.example.filter at "
-                              "file:///System/PlugIns/My%20Filter.plugin: {HXExtension: []}"});
-  EXPECT_EQ(partly.bundleInfoDictionary(), Value(Dictionary{{"HXExtension", Array{}}}));
-  EXPECT_TRUE(partly.pluginKey("Kept").booleanValue());
-  EXPECT_FALSE(partly.setDictionaries("no dictionary"));
-  EXPECT_TRUE(partly.bundleInfoDictionary().isDictionary());
-
-  EXPECT_NE(record(infoWith({{"Multiple", false}})), nullptr);
-  EXPECT_EQ(log.take(), Lines{"DEFAULT ops: multiplexed plug-ins (Multiple key) obsolete and ignored"});
-}
-
-TEST(XTPlugInCore, IdentityIsTheUuidAlone) {
-  const auto a = record({});
-  const auto b = record({});
-  EXPECT_NE(*a, *b);
-  EXPECT_NE(a->uuid(), Uuid());
-  XTPlugInCore copy = *a;
-  copy.setIdentifier("com.example.other");
-  EXPECT_EQ(copy, *a);
-  EXPECT_EQ(copy.hash(), a->hash());
-}
-
-TEST(XTPlugInCore, AppExtensionsHaveDefaults) {
-  const auto extension = record(infoWith({}));
-  EXPECT_TRUE(extension->isAppExtension());
-  EXPECT_EQ(extension->protocolSpec(), Value("HXObject"));
-  EXPECT_EQ(extension->principalSpec(), Value("HXObject"));
-  EXPECT_EQ(extension->embeddedProtocolSpec(), Value("HXObject"));
-  for (const char* path : {"/P/Filter.APPEX", "/P/Filter.appex2", "/P/Filter.appex/inner"}) {
-    const auto other = record(infoWith({{"EmbeddedProtocol", "Inner"}}), Url::file(path));
-    EXPECT_FALSE(other->isAppExtension()) << path;
-    EXPECT_TRUE(other->protocolSpec().isNothing());
-    EXPECT_TRUE(other->principalSpec().isNothing());
-    EXPECT_EQ(other->embeddedProtocolSpec(), Value("Inner"));
-  }
-}
-
 TEST(XTPlugInCore, StylesAreReadFromTheMetadata) {
   for (const auto& [protocol, data] : std::vector<std::pair<Value, bool>>{
            {"#Data", true}, {"#data", false}, {"#Data ", false}, {Array{"#Data"}, false}, {{}, false}}) {
@@ -92,25 +42,6 @@ TEST(XTPlugInCore, StylesAreReadFromTheMetadata) {
   EXPECT_FALSE(plugIn.oldStyle());
   plugIn.setBundleInfoDictionary({});
   EXPECT_THROW((void)plugIn.oldStyle(), platform::InternalInconsistency);
-}
-
-TEST(XTPlugInCore, CanonicalizeCompletesTheVersion) {
-  const auto versionAfter = [](Dictionary plugIn, const Value& marketing) {
-    Dictionary info = infoWith(std::move(plugIn));
-    info.set("HBBundleShortVersionString", marketing);
-    const auto completed = record(info);
-    completed->canonicalize();
-    EXPECT_EQ(completed->bundleInfoDictionary(), Value(info));
-    return completed->version();
-  };
-  const Dictionary attributes = {{"HXExtensionVersion", "3.0"}, {"Other", 1}};
-  EXPECT_EQ(versionAfter({}, "2.1"), "2.1");
-  EXPECT_EQ(versionAfter({}, {}), "1");
-  EXPECT_EQ(versionAfter({{"HXExtensionAttributes", attributes}}, "2.1"), "3.0");
-
-  XTPlugInCore empty;
-  empty.canonicalize();
-  EXPECT_EQ(empty.plugInDictionary()["HXExtensionAttributes"]["HXExtensionVersion"], Value("1"));
 }
 
 TEST(XTPlugInCore, LocalizedInfoForHosts) {
