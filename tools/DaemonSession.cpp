@@ -40,6 +40,14 @@ ExitStatus DaemonSession::ask(const Send& send, Value& reply, const std::string&
   return ExitStatus::Success;
 }
 
+ExitStatus DaemonSession::match(const platform::Dictionary& rules, std::uint64_t flags, Value& forms) {
+  Value reply;
+  const ExitStatus status = ask([&](auto& client, const auto& answer) { client.matchPlugIns(rules, flags, answer); },
+                                reply, (flags & extora::XTDiscoverAll) != 0 ? kManagersOnly : "");
+  if (status == ExitStatus::Success) forms = matches(reply);
+  return status;
+}
+
 Value DaemonSession::matches(const Value& reply) const {
   return client_ ? client_->convertFromIPC(reply[extora::XTDMatchesKey]) : Value();
 }

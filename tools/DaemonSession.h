@@ -25,6 +25,9 @@ class DaemonSession {
   /// `hint` is a second line for a refusal of what the caller may not do, empty for none.
   [[nodiscard]] ExitStatus ask(const Send& send, platform::Value& reply, const std::string& hint = {});
 
+  /// A "match" with these rules and flags, likewise: its forms go into `forms`.
+  [[nodiscard]] ExitStatus match(const platform::Dictionary& rules, std::uint64_t flags, platform::Value& forms);
+
   /// As ask(), but hands the reply on as it is and says nothing.
   [[nodiscard]] platform::IpcReplyObject request(const Send& send);
   /// False before the first question, and when the connection has been lost.

@@ -24,15 +24,13 @@ CLI::App* ElectionsCommand::addTo(CLI::App& app) {
 ExitStatus ElectionsCommand::run(DaemonSession& daemon, std::string& out) {
   std::uint64_t flags = extora::XTDiscoverSynchronously | extora::XTDiscoverAllVersions | extora::XTDiscoverDuplicates;
   if (all_) flags |= extora::XTDiscoverAll;
-  Value reply;
-  const ExitStatus status =
-      daemon.ask([&](auto& client, const auto& answer) { client.matchPlugIns({}, flags, answer); }, reply,
-                 all_ ? kManagersOnly : "");
+  Value forms;
+  const ExitStatus status = daemon.match({}, flags, forms);
   if (status != ExitStatus::Success) return status;
 
   Table table({"ELECTION", "IDENTIFIER", "VERSION", "UUID", "FLAGS", "PATH"});
   Array list;
-  for (const Value& form : sortedForms(daemon.matches(reply))) {
+  for (const Value& form : sortedForms(forms)) {
     const Value& election = form[extora::XTAnnotationsFormKey][extora::XTAnnotationElectionKey];
     if (electionText(election) == "none") continue;
     const bool automatic = form[extora::XTEntitlementsFormKey][extora::XTAutoElectEntitlement].booleanValue();

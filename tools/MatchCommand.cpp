@@ -64,13 +64,11 @@ ExitStatus MatchCommand::run(DaemonSession& daemon, std::string& out) {
   if (duplicates_) flags |= extora::XTDiscoverDuplicates;
   if (systemOnly_) flags |= extora::XTDiscoverSystemOnly;
   if (all_) flags |= extora::XTDiscoverAll;
-  Value reply;
-  const ExitStatus status =
-      daemon.ask([&](auto& client, const auto& answer) { client.matchPlugIns(*rules, flags, answer); }, reply,
-                 all_ ? kManagersOnly : "");
+  Value found;
+  const ExitStatus status = daemon.match(*rules, flags, found);
   if (status != ExitStatus::Success) return status;
 
-  const auto forms = sortedForms(daemon.matches(reply));
+  const auto forms = sortedForms(found);
   if (json_) {
     out += jsonText(platform::Array(forms));
   } else if (forms.empty()) {

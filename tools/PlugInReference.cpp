@@ -31,22 +31,20 @@ PlugInReference PlugInReference::parse(const std::string& text) {
 }
 
 ExitStatus PlugInReference::find(DaemonSession& daemon, Value& form) const {
-  Value reply;
-  ExitStatus status = ExitStatus::Success;
   if (isIdentifier()) {
     const Dictionary rules{{extora::XTIdentifierAttribute, "=" + text}};
-    status = daemon.ask([&](auto& client, const auto& answer) { client.matchPlugIns(rules, 0, answer); }, reply);
-    if (status != ExitStatus::Success) return status;
-    const Value forms = daemon.matches(reply);
+    Value forms;
+    if (const ExitStatus status = daemon.match(rules, 0, forms); status != ExitStatus::Success) return status;
     for (const Value& each : forms.items()) {
       if (each[extora::XTIdentifierFormKey].string() != text) continue;
       form = each;
-      return status;
+      return ExitStatus::Success;
     }
     complain(fmt::format("no plug-in with the identifier {} is offered here; name it by UUID or path", text));
     return ExitStatus::Refused;
   }
-  status = daemon.ask(
+  Value reply;
+  const ExitStatus status = daemon.ask(
       [&](auto& client, const auto& answer) {
         uuid ? client.findPlugInByUUID(*uuid, answer) : client.findPlugInByPathURL(*url, answer);
       },

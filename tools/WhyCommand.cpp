@@ -26,15 +26,6 @@ std::string nameOf(const Value& form) {
   return fmt::format("{} {}", form[extora::XTIdentifierFormKey], form[extora::XTVersionFormKey]);
 }
 
-// A question of this command that the daemon answers at all.
-ExitStatus match(DaemonSession& daemon, const Dictionary& rules, std::uint64_t flags, Value& forms) {
-  Value reply;
-  const ExitStatus status =
-      daemon.ask([&](auto& client, const auto& answer) { client.matchPlugIns(rules, flags, answer); }, reply);
-  forms = daemon.matches(reply);
-  return status;
-}
-
 // Why hosts like this one are not offered the plug-in though it is asked for by its UUID alone.
 std::string hostReason(DaemonSession& daemon, const Value& form) {
   const Value& application = form[extora::XTContainingPathFormKey];
@@ -104,20 +95,20 @@ ExitStatus WhyCommand::run(DaemonSession& daemon, std::string& out) {
     }
     return status;
   }
-  const auto say = [&](const std::string& answer, const std::string& reason) {
-    out += platform::escapeControlCharacters(nameOf(form) + ": " + answer) + "\n";
-    if (!reason.empty()) out += "  " + platform::escapeControlCharacters(reason) + "\n";
-    return answer == "offered" ? ExitStatus::Success : ExitStatus::Refused;
+  const std::string name = platform::escapeControlCharacters(nameOf(form));
+  const auto notOffered = [&](const std::string& reason) {
+    out += name + ": not offered\n  " + platform::escapeControlCharacters(reason) + "\n";
+    return ExitStatus::Refused;
   };
 
   const Value& uuid = form[extora::XTUUIDFormKey];
   Value forms;
-  ExitStatus status = match(daemon, {{extora::XTUUIDAttribute, uuid}}, 0, forms);
+  ExitStatus status = daemon.match({{extora::XTUUIDAttribute, uuid}}, 0, forms);
   if (status != ExitStatus::Success) return status;
-  if (forms.size() == 0) return say("not offered", hostReason(daemon, form));
+  if (forms.size() == 0) return notOffered(hostReason(daemon, form));
 
   for (const auto& [key, pattern] : *rules) {
-    status = match(daemon, {{extora::XTUUIDAttribute, uuid}, {key, pattern}}, 0, forms);
+    status = daemon.match({{extora::XTUUIDAttribute, uuid}, {key, pattern}}, 0, forms);
     if (status != ExitStatus::Success) return status;
     if (forms.size() != 0) continue;
     std::string reason = fmt::format("the rule {} = {} does not hold", key, pattern);
@@ -125,21 +116,24 @@ ExitStatus WhyCommand::run(DaemonSession& daemon, std::string& out) {
       reason +=
           "; its election is " + electionText(form[extora::XTAnnotationsFormKey][extora::XTAnnotationElectionKey]);
     }
-    return say("not offered", reason);
+    return notOffered(reason);
   }
 
   Dictionary all = *rules;
   if (!all.contains(extora::XTIdentifierAttribute)) {
     all.set(extora::XTIdentifierAttribute, "=" + form[extora::XTIdentifierFormKey].string());
   }
-  status = match(daemon, all, 0, forms);
+  status = daemon.match(all, 0, forms);
   if (status != ExitStatus::Success) return status;
   const Value* rival = nullptr;
   for (const Value& each : forms.items()) {
-    if (each[extora::XTUUIDFormKey] == uuid) return say("offered", "");
+    if (each[extora::XTUUIDFormKey] == uuid) {
+      out += name + ": offered\n";
+      return ExitStatus::Success;
+    }
     if (each[extora::XTIdentifierFormKey] == form[extora::XTIdentifierFormKey]) rival = &each;
   }
-  return say("not offered", rival != nullptr ? rivalReason(form, *rival) : "it was, a moment ago");
+  return notOffered(rival != nullptr ? rivalReason(form, *rival) : "it was, a moment ago");
 }
 
 }  // namespace tools

@@ -128,22 +128,14 @@ std::string IpcSocketConnection::describe() const {
 // Reading.
 
 void IpcSocketConnection::handleEvent() {
-  bool ended = false;
+  bool atEnd = false;
   {
     MutexLock lock(mutex_);
-    ended = claim_ == Claim::Serving;
-    if (claim_ != Claim::Armed && !ended) return;
+    atEnd = claim_ == Claim::Serving;
+    if (claim_ != Claim::Armed && !atEnd) return;
     claim_ = Claim::Reading;
-    if (ended) {
-      sendRest_ = false;
-      end();
-    }
   }
-  if (ended) {
-    finish();
-  } else {
-    release(reader_.read(socket_, MSG_DONTWAIT, *this), false);
-  }
+  release(atEnd ? IpcFrameReader::Outcome::EndOfInput : reader_.read(socket_, MSG_DONTWAIT, *this), false);
 }
 
 // Ends the claim of the calling thread: the connection is read on by whoever is next, or has come to its end.
@@ -154,16 +146,15 @@ void IpcSocketConnection::release(IpcFrameReader::Outcome outcome, bool synchron
     if (outcome == Outcome::Broken) malformed_ = reader_.brokenReason();
     {
       MutexLock lock(mutex_);
-      if (outcome == Outcome::EndOfInput && !cancelled_ && peerListens()) {
-        sendRest_ = true;
-        if (unserved_ > 0) {
-          claim_ = Claim::Serving;
-          IpcEventPool::shared().disarm(socket_, token_);
-          return;
-        }
+      sendRest_ = outcome == Outcome::EndOfInput && !cancelled_ && peerListens();
+      if (sendRest_ && unserved_ > 0) {
+        claim_ = Claim::Serving;
+        IpcEventPool::shared().disarm(socket_, token_);
+        return;
       }
       if (ended && !cancelled_) {
-        end();
+        valid_ = false;
+        reason_ = malformed_.empty() ? "the peer has gone" : malformed_;
       } else if (!cancelled_ && unserved_ >= kIpcMaxUnservedRequests) {
         claim_ = Claim::Paused;
         return;
@@ -182,11 +173,6 @@ void IpcSocketConnection::release(IpcFrameReader::Outcome outcome, bool synchron
 bool IpcSocketConnection::peerListens() const {
   struct pollfd entry = {socket_, 0, 0};
   return settings_.service && ::poll(&entry, 1, 0) == 0;
-}
-
-void IpcSocketConnection::end() {
-  valid_ = false;
-  reason_ = malformed_.empty() ? "the peer has gone" : malformed_;
 }
 
 void IpcSocketConnection::park(bool synchronous) {
@@ -231,8 +217,7 @@ void IpcSocketConnection::requestServed() {
   --unserved_;
   if (claim_ == Claim::Serving && unserved_ == 0) {
     claim_ = Claim::Reading;
-    end();
-    ThreadPool::workers().submit([self = self()] { self->finish(); });
+    ThreadPool::workers().submit([self = self()] { self->release(IpcFrameReader::Outcome::EndOfInput, false); });
     return;
   }
   if (claim_ != Claim::Paused || unserved_ >= kIpcMaxUnservedRequests) return;

@@ -116,7 +116,6 @@ class IpcSocketConnection final : public IpcConnection,
   void finish();
 
   bool peerListens() const;
-  void end() XT_REQUIRES(mutex_);
   void park(bool synchronous) XT_REQUIRES(mutex_);
   void arm() XT_REQUIRES(mutex_);
   void watchResting() XT_REQUIRES(mutex_);

@@ -85,8 +85,7 @@ class PropertyListWriter {
 
   bool writeText(const std::string& text, std::string_view element, std::size_t depth) {
     if (!isXmlText(text)) return refuse("a string with characters that XML lacks");
-    out_.append(depth, '\t');
-    (out_ += '<').append(element) += '>';
+    open(element, depth);
     // There is no NUL in such a text, and the library looks at many characters at once.
     for (const char* rest = text.c_str(); *rest != '\0';) {
       const std::size_t plain = std::strcspn(rest, "&<>\r");
@@ -94,8 +93,7 @@ class PropertyListWriter {
       rest += plain;
       if (*rest != '\0') out_ += escapeOf(*rest++);
     }
-    (out_ += "</").append(element) += ">\n";
-    return true;
+    return close(element);
   }
 
   static std::string_view escapeOf(char c) {
@@ -119,8 +117,17 @@ class PropertyListWriter {
 
   // `text` needs no escape.
   bool writeElement(std::string_view element, std::string_view text, std::size_t depth) {
+    open(element, depth);
+    out_ += text;
+    return close(element);
+  }
+
+  void open(std::string_view element, std::size_t depth) {
     out_.append(depth, '\t');
-    ((out_ += '<').append(element) += '>').append(text);
+    (out_ += '<').append(element) += '>';
+  }
+
+  bool close(std::string_view element) {
     (out_ += "</").append(element) += ">\n";
     return true;
   }
